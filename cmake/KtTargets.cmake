@@ -1,0 +1,53 @@
+# The targets of this project, made in one way: warnings, sanitizers, and the two forms of each library.
+
+# What everything here is compiled with.
+add_library(kt_options INTERFACE)
+target_compile_options(kt_options INTERFACE -Wall -Wextra -Wpedantic -Wconversion $<$<BOOL:${KT_WERROR}>:-Werror>)
+# GCC 12 sees overflows in inlined code that can't happen, once sanitizers stand between.
+if(KT_SANITIZE AND CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+  target_compile_options(kt_options INTERFACE -Wno-maybe-uninitialized -Wno-stringop-overflow -Wno-array-bounds)
+endif()
+if(KT_SANITIZE)
+  target_compile_options(kt_options INTERFACE -fsanitize=${KT_SANITIZE} -fno-omit-frame-pointer
+                                              -fno-sanitize-recover=all)
+  target_link_options(kt_options INTERFACE -fsanitize=${KT_SANITIZE})
+endif()
+
+# What the libraries are compiled with besides. Without exceptions, so that a thread that is cancelled inside an
+# updating call leaves its locks held.
+add_library(kt_library_options INTERFACE)
+target_link_libraries(kt_library_options INTERFACE kt_options)
+target_compile_options(kt_library_options INTERFACE $<$<COMPILE_LANGUAGE:CXX>:-fno-exceptions -fno-rtti>
+                                                    -fvisibility=hidden)
+
+# kt_add_library(<name> EXPORTS <version script> LINK <libraries> SOURCES ...)
+#
+# Makes from one set of objects the shared library lib<name>.so.1, which exports what the version script names, and the
+# archive lib<name>_internal.a with nothing left out, for tests and tools.
+function(kt_add_library name)
+  cmake_parse_arguments(ARG "" "EXPORTS" "LINK;SOURCES" ${ARGN})
+
+  add_library(${name}_objects OBJECT ${ARG_SOURCES})
+  target_include_directories(${name}_objects PUBLIC ${PROJECT_SOURCE_DIR}/include PRIVATE ${PROJECT_SOURCE_DIR}/src)
+  target_link_libraries(${name}_objects PRIVATE kt_library_options)
+
+  add_library(${name} SHARED $<TARGET_OBJECTS:${name}_objects>)
+  target_include_directories(${name} PUBLIC $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include>
+                                            $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>)
+  target_link_libraries(${name} PRIVATE $<BUILD_INTERFACE:kt_library_options> Threads::Threads)
+  target_link_options(${name} PRIVATE -Wl,--version-script=${ARG_EXPORTS} -Wl,--no-undefined-version)
+  set_target_properties(${name} PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
+                                           LINK_DEPENDS ${ARG_EXPORTS})
+  if(NOT KT_SANITIZE)
+    target_link_options(${name} PRIVATE -Wl,--no-undefined)
+  endif()
+
+  add_library(${name}_internal STATIC $<TARGET_OBJECTS:${name}_objects>)
+  target_include_directories(${name}_internal PUBLIC ${PROJECT_SOURCE_DIR}/include ${PROJECT_SOURCE_DIR}/src)
+  target_link_libraries(${name}_internal PUBLIC Threads::Threads)
+
+  foreach(dependency IN LISTS ARG_LINK)
+    target_link_libraries(${name} PUBLIC ${dependency})
+    target_link_libraries(${name}_internal PUBLIC ${dependency}_internal)
+  endforeach()
+endfunction()

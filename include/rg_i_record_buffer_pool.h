@@ -1,0 +1,131 @@
+// SPDX-License-Identifier: MIT
+// rg_i_record_buffer_pool: the allocator in which a table's metadata record and all its row records live.
+//
+// First fit in address order, with coalescing, and an exact count of the bytes in use, which the rewrite decision is
+// made from. Allocation is in two steps: a caller is lent a whole free record to build in, and takes what it used.
+// Between the two nothing else may touch the pool. No lock: the table's write lock covers every use.
+//
+// Everywhere a pointer to a record is the address of its data, RG_I_RECORD_HEAD_LENGTH bytes behind its head.
+#pragma once
+
+#include <cstddef>
+#include <cstring>
+#include <type_traits>
+
+#include "kt_types.h"
+
+// What a record is, in memory and on disk. On disk, never renumber.
+enum : kt_uint32_t {
+    RG_RECORD_TYPE_FREE         = 0,
+    RG_RECORD_TYPE_METADATA     = 1,
+    RG_RECORD_TYPE_ROW          = 2,
+    RG_RECORD_TYPE_DELETED_ROWS = 3,
+    RG_RECORD_TYPE_COMMIT       = 0xFFFFFFFFu
+};
+
+#pragma pack(push, 1)
+
+// One block from the heap. Records tile it without gaps from byte 12 to byte total_bytes.
+struct rg_i_record_buffer_t {
+    rg_i_record_buffer_t * p_next;      // bytes 0-7: next block of the pool
+    kt_uint32_t            total_bytes; // bytes 8-11: size of the block, this head included
+};
+
+// The head of every record.
+struct rg_i_record_metadata_t {
+    kt_uint32_t   record_length;     // bytes 0-3: length of the record, this head included
+    kt_char_ptr_t p_next;            // bytes 4-11: while free, the next free record's head; stale once allocated
+    kt_uint32_t   type;              // bytes 12-15: RG_RECORD_TYPE_...
+    kt_uint32_t   disk_table_offset; // bytes 16-19: file offset, stamped by apply and open; the pool doesn't use it
+};
+
+#pragma pack(pop)
+
+inline constexpr kt_uint32_t RG_I_RECORD_BUFFER_HEAD_LENGTH = 12;
+inline constexpr kt_uint32_t RG_I_RECORD_HEAD_LENGTH        = 20;
+
+static_assert(sizeof(rg_i_record_buffer_t) == RG_I_RECORD_BUFFER_HEAD_LENGTH);
+static_assert(offsetof(rg_i_record_buffer_t, total_bytes) == 8);
+static_assert(sizeof(rg_i_record_metadata_t) == RG_I_RECORD_HEAD_LENGTH);
+static_assert(offsetof(rg_i_record_metadata_t, p_next) == 4 && offsetof(rg_i_record_metadata_t, type) == 12 &&
+              offsetof(rg_i_record_metadata_t, disk_table_offset) == 16);
+static_assert(std::is_trivially_copyable_v<rg_i_record_metadata_t>);
+
+struct rg_i_free_record_index_t; // leads to a place in the free chain without walking it
+
+// A pool of zero bytes is an empty pool.
+struct rg_i_record_buffer_pool_t {
+    kt_uint32_t                total_bytes;  // of all blocks
+    kt_uint32_t                used_bytes;   // heads of blocks, heads of all records, data of allocated records
+    kt_char_ptr_t              p_free_chain; // head of the first free record; ascending address order
+    rg_i_record_buffer_t *     p_first_record_buffer; // first block
+    rg_i_record_buffer_t *     p_last_record_buffer;  // last block
+    rg_i_free_record_index_t * p_free_index;          // owned; NULL while the pool has no block
+};
+
+static_assert(offsetof(rg_i_record_buffer_pool_t, p_free_chain) == 8 &&
+              offsetof(rg_i_record_buffer_pool_t, p_last_record_buffer) == 24);
+
+// How the addresses in one pool map to its copy: one array element per source block.
+struct rg_i_record_buffer_pool_duplication_map_t {
+    kt_uint32_t     total;    // source blocks
+    kt_char_ptr_t * p_begin;  // first byte behind each block's head
+    kt_char_ptr_t * p_end;    // first byte behind each block
+    kt_int32_t *    p_offset; // destination minus source, cut to 32 bits
+    kt_char_ptr_t * p_to;     // where each block's first byte went: right at any distance
+};
+
+[[nodiscard]] inline rg_i_record_metadata_t * rg_i_record_head(kt_char_ptr_t p_data)
+{
+    return reinterpret_cast<rg_i_record_metadata_t *>(p_data - RG_I_RECORD_HEAD_LENGTH);
+}
+
+[[nodiscard]] inline const rg_i_record_metadata_t * rg_i_record_head(const kt_char_t * p_data)
+{
+    return reinterpret_cast<const rg_i_record_metadata_t *>(p_data - RG_I_RECORD_HEAD_LENGTH);
+}
+
+// Bytes of data that the record holds.
+[[nodiscard]] inline kt_uint32_t rg_i_record_data_length(const kt_char_t * p_data)
+{
+    return rg_i_record_head(p_data)->record_length - RG_I_RECORD_HEAD_LENGTH;
+}
+
+[[nodiscard]] kt_int32_t rg_i_rb_initialize_record_buffer_pool(kt_uint32_t                 total_pages,
+                                                               rg_i_record_buffer_pool_t * p_record_buffer_pool);
+kt_int32_t               rg_i_rb_uninitialize_record_buffer_pool(rg_i_record_buffer_pool_t * p_record_buffer_pool);
+
+// Lends a free record of at least data_length bytes, all zero. Nothing is taken until rg_i_rb_allocate_record.
+[[nodiscard]] kt_int32_t rg_i_rb_find_suitable_record(rg_i_record_buffer_pool_t * p_record_buffer_pool,
+                                                      kt_uint32_t data_length, kt_char_ptr_t * p_data,
+                                                      kt_char_ptr_t * p_previous_free_record,
+                                                      kt_uint32_t *   actual_data_length);
+[[nodiscard]] kt_int32_t rg_i_rb_allocate_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_char_ptr_t p_data,
+                                                 kt_char_ptr_t p_previous_free_record, kt_uint32_t data_length,
+                                                 kt_uint32_t record_type);
+kt_int32_t               rg_i_rb_free_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_char_ptr_t p_data);
+kt_uint32_t rg_i_rb_insert_free_record(kt_char_ptr_t p_new_free_record, kt_char_ptr_t * p_free_chain_returned,
+                                       kt_char_ptr_t * p_previous_free_record_returned);
+// Find and allocate in one, for a length known beforehand. The data is all zero.
+[[nodiscard]] kt_int32_t rg_i_reserve_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_uint32_t length,
+                                             kt_uint32_t type, kt_char_ptr_t * p_record_data);
+
+// The same two steps for builders that write every byte they take (rows): the room is handed out as it is, so that the
+// cost doesn't grow with the free record, and only what is taken beyond data_length is zeroed.
+//
+// A builder that gives up after writing into the lent room must say how far it wrote with rg_i_rb_give_back_record.
+[[nodiscard]] kt_int32_t rg_i_rb_lend_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_uint32_t data_length,
+                                             kt_char_ptr_t * p_data, kt_char_ptr_t * p_previous_free_record,
+                                             kt_uint32_t * actual_data_length);
+[[nodiscard]] kt_int32_t rg_i_rb_take_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_char_ptr_t p_data,
+                                             kt_char_ptr_t p_previous_free_record, kt_uint32_t data_length,
+                                             kt_uint32_t record_type);
+void rg_i_rb_give_back_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_char_ptr_t p_data,
+                              kt_uint32_t bytes_written);
+
+[[nodiscard]] kt_int32_t
+              rg_i_rb_duplicate_record_buffer_pool(rg_i_record_buffer_pool_t * p_from, rg_i_record_buffer_pool_t * p_to,
+                                                   rg_i_record_buffer_pool_duplication_map_t ** p_duplication_map);
+kt_char_ptr_t rg_i_rb_map_duplicated_address(rg_i_record_buffer_pool_duplication_map_t * p_duplication_map,
+                                             kt_char_ptr_t                               p_from);
+kt_int32_t    rg_i_rb_free_duplication_map(rg_i_record_buffer_pool_duplication_map_t * p_duplication_map);
