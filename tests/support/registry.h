@@ -75,8 +75,9 @@ class open_tree
                 operator rg_opaque_handle_t() const { return handle_; }
     void        close()
     {
-        if (handle_ != nullptr)
+        if (handle_ != nullptr) {
             EXPECT_EQ(rg_close_tree_1(std::exchange(handle_, nullptr)), 0);
+        }
     }
     void mount(const std::string & registry_path, const std::string & directory)
     {
