@@ -161,10 +161,60 @@ kt_int32_t rg_abort_1(rg_opaque_handle_t table_handle);
 
 /* ---- Adding rows ----------------------------------------------------------------------------------------------- */
 
+/* Adds a row to the table's pending state; on an implicitly controlled table it is applied and committed as well.
+ *
+ *   p_column_names  total_values names, each once, the key column's among them; matched exactly
+ *   p_p_fields      the values, in the order of the names. A NULL pointer inside a value of an indirect type stands for
+ *                   the type's empty value. The row holds a copy: the values stay the caller's
+ *
+ * A column that isn't named takes its default, whatever its qualifier. On a table with a hash table, a key whose row's
+ * deletion is pending revives that row: it keeps its fixed index.
+ *
+ * Returns 0, or with nothing changed:
+ *   RG_E_INVALID_HANDLE       table_handle is NULL
+ *   RG_E_ACCESS               the table isn't open for writing
+ *   RG_E_APPLIED_UNCOMMITTED  updates are applied and not committed
+ *   RG_E_NULL_POINTER         an array, a name or a value pointer is NULL
+ *   RG_E_KEY_EXPECTED         the key column isn't named
+ *   RG_E_NO_COLUMNS           a name that no column has, or one that stands twice
+ *   RG_E_DUPLICATE_KEY        a row has the key already (RG_PRIMARY_KEY only; see docs/ODDITIES.md on reused slots)
+ *   RG_E_LIBRARY_CALL         a value can't be stored: a string that the table's encoding can't hold, or a broken
+ * record RG_E_NO_MEMORY            no memory for the record, the index or the change RG_E_INTERNAL             in a
+ * forked child, without an error record; or the hash function returned no bucket and on an implicitly controlled table
+ * the codes of rg_apply_1, with the row taken back, and of rg_commit_1. Thread-safe; the updates of a process run one
+ * at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
+
 kt_int32_t rg_add_row_1(rg_opaque_handle_t table_handle, kt_char_ptr_t * p_column_names, kt_value_t ** p_p_fields,
                         kt_uint32_t total_values);
 
-/* ---- Reading fields -------------------------------------------------------------------------------------------- */
+/* ---- Reading fields --------------------------------------------------------------------------------------------
+ *
+ * A row is addressed by its packed index (dense, 0 to the number of rows - 1; changes when rows go away), by its fixed
+ * index (stays with the row while it lives) or by its key. The plain forms see the committed state. The visibility
+ * forms see the applied state as well if uncommitted_updates_visible isn't 0, and deliver the row's state; so does
+ * every form if the table was made with RG_UNCOMMITTED_UPDATES_VISIBLE in the environment.
+ *
+ *   column_name(s)  matched exactly; a column of any qualifier can be read
+ *   result          where the value goes, or array_count pointers to where the values go. A scalar is copied; anything
+ *                   else is one block that belongs to the caller, who releases it with free
+ *   p_row_state     gets the row's state on success; may be NULL
+ *
+ * Each returns 0 or, with nothing changed but what is said below:
+ *   RG_E_INVALID_HANDLE  table_handle is NULL
+ *   RG_E_NULL_POINTER    a name or a result pointer is NULL; a NULL pointer as key
+ *   RG_E_NO_SUCH_KEY     no row has the key. Keys are compared as they stand, without conversion of strings. The key of
+ *                        an updated row is the committed one if the table has no hash table
+ *   RG_E_NO_SUCH_INDEX   the packed index is not below the number of rows, or the fixed index not below the number of
+ *                        slots; a negative index is taken as a large one
+ *   RG_E_INVALID_COLUMN  no column has the name
+ *   RG_E_ROW_DELETED     the row has no record in the state that is looked at, or no row is at the index. For one field
+ *                        this comes after RG_E_INVALID_COLUMN, for several ahead of it
+ *   RG_E_LIBRARY_CALL    a value can't be delivered: no memory, a string that the client's encoding can't hold, or
+ *                        damaged bytes in the table
+ *   RG_E_INTERNAL        the table's hash function returned no bucket
+ * The forms for several fields deliver them one at a time: after a failure those ahead of it are delivered, and the
+ * caller, who may have cleared the values first, frees them. With array_count 0 they only look at the row.
+ * Thread-safe: any number of readers run together, in a forked child too. See docs/ARCHITECTURE.md. */
 
 kt_int32_t rg_get_field_by_index_1(rg_opaque_handle_t table_handle, kt_int32_t row_index, kt_char_ptr_t column_name,
                                    kt_value_t * result);
@@ -198,6 +248,9 @@ kt_int32_t rg_get_fields_by_key_and_visibility_1(rg_opaque_handle_t table_handle
                                                  kt_char_ptr_t * column_names, kt_value_t ** result,
                                                  kt_uint32_t array_count, kt_uint32_t uncommitted_updates_visible,
                                                  rg_row_state_t * p_row_state);
+/* Delivers the fixed index of the row with the key, which is found whatever its state: committed, added, or with its
+ * deletion pending. With several rows of one key (RG_PRIMARY_KEY_NOCHECK) a hashed table gives the one added last, and
+ * any other the one at the lowest packed index. Codes as above. */
 kt_int32_t rg_get_fixed_row_index_for_key_1(rg_opaque_handle_t table_handle, kt_value_t key_value,
                                             kt_uint32_t * p_fixed_row_index);
 

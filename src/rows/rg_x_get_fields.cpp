@@ -1,0 +1,67 @@
+// SPDX-License-Identifier: MIT
+// rg_x_get_fields: the exported reads of several fields of a row.
+//
+// Layer: frame over rows. Each is the frame of a reading call around its worker in rg_i_get_values. A negative index is
+// taken as a large one, and so is out of range.
+#include "frame/rg_i_call_frame.h"
+
+namespace
+{
+
+constexpr char module_version[] = "rg_x_get_fields 1.0";
+
+} // namespace
+
+kt_int32_t rg_get_fields_by_index_1(rg_opaque_handle_t table_handle, kt_int32_t row_index, kt_char_ptr_t * column_names,
+                                    kt_value_t ** result, kt_uint32_t array_count)
+{
+    return rg_i_reading_call<entry_id::get_fields_by_index>(RG_HERE, table_handle, [&](rg_i_table_t & table) {
+        return rg_i_get_values_for_packed_index(&table, static_cast<kt_uint32_t>(row_index), column_names, result,
+                                                array_count, 0, nullptr);
+    });
+}
+
+kt_int32_t rg_get_fields_by_index_and_visibility_1(rg_opaque_handle_t table_handle, kt_int32_t row_index,
+                                                   kt_char_ptr_t * column_names, kt_value_t ** result,
+                                                   kt_uint32_t array_count, kt_uint32_t uncommitted_updates_visible,
+                                                   rg_row_state_t * p_row_state)
+{
+    return rg_i_reading_call<entry_id::get_fields_by_index_and_visibility>(
+        RG_HERE, table_handle, [&](rg_i_table_t & table) {
+            return rg_i_get_values_for_packed_index(&table, static_cast<kt_uint32_t>(row_index), column_names, result,
+                                                    array_count, uncommitted_updates_visible, p_row_state);
+        });
+}
+
+kt_int32_t rg_get_fields_by_fixed_index_and_visibility_1(rg_opaque_handle_t table_handle, kt_int32_t fixed_row_index,
+                                                         kt_char_ptr_t * column_names, kt_value_t ** result,
+                                                         kt_uint32_t      array_count,
+                                                         kt_uint32_t      uncommitted_updates_visible,
+                                                         rg_row_state_t * p_row_state)
+{
+    return rg_i_reading_call<entry_id::get_fields_by_fixed_index_and_visibility>(
+        RG_HERE, table_handle, [&](rg_i_table_t & table) {
+            return rg_i_get_values_for_fixed_index(&table, static_cast<kt_uint32_t>(fixed_row_index), column_names,
+                                                   result, array_count, uncommitted_updates_visible, p_row_state);
+        });
+}
+
+kt_int32_t rg_get_fields_by_key_1(rg_opaque_handle_t table_handle, kt_value_t row_key, kt_char_ptr_t * column_names,
+                                  kt_value_t ** result, kt_uint32_t array_count)
+{
+    return rg_i_reading_call<entry_id::get_fields_by_key>(RG_HERE, table_handle, [&](rg_i_table_t & table) {
+        return rg_i_get_values_for_key(&table, row_key, column_names, result, array_count, 0, nullptr);
+    });
+}
+
+kt_int32_t rg_get_fields_by_key_and_visibility_1(rg_opaque_handle_t table_handle, kt_value_t row_key,
+                                                 kt_char_ptr_t * column_names, kt_value_t ** result,
+                                                 kt_uint32_t array_count, kt_uint32_t uncommitted_updates_visible,
+                                                 rg_row_state_t * p_row_state)
+{
+    return rg_i_reading_call<entry_id::get_fields_by_key_and_visibility>(
+        RG_HERE, table_handle, [&](rg_i_table_t & table) {
+            return rg_i_get_values_for_key(&table, row_key, column_names, result, array_count,
+                                           uncommitted_updates_visible, p_row_state);
+        });
+}
