@@ -76,6 +76,8 @@ kt_int32_t kt_pmsg_build_conv_packed_client_value_1(ku_iconv_t * p_string_conver
                                                     kt_data_type_t type, kt_value_t * p_value, const void * p_slot,
                                                     const void * p_indirect_data, kt_pmsg_len_t indirect_data_bound);
 kt_int32_t kt_pmsg_cnv_required_1(kt_pmsg_header_t * p_header, kt_int32_t * p_required);
+kt_int32_t kt_pmsg_convert_pmsg_value_within_1(void * p_slot, kt_data_type_t type, void * p_indirect_data,
+                                               kt_pmsg_len_t indirect_data_bound);
 kt_int32_t kt_pmsg_convert_pmsg_value_1(void * p_slot, kt_data_type_t type, void * p_indirect_data);
 
 #pragma GCC visibility pop
