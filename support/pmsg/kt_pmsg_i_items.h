@@ -94,42 +94,39 @@ struct stored_item {
 template <word_order Order>
 [[nodiscard]] kt_int32_t check_item(kt_data_type_t type, stored_item item, unsigned level, client_measure * p_measure);
 
-// The number of bytes that an item's head and inner length tell, without the items inside it; false: they leave it.
-template <word_order Order>
-[[nodiscard]] bool own_length(kt_data_type_t type, stored_item item, std::uint64_t * p_length)
+// The bytes that an item takes by its own account, without the items inside it. Of a damaged item that is more than its
+// length.
+template <word_order Order> [[nodiscard]] std::uint64_t own_length(kt_data_type_t type, stored_item item)
 {
+    const std::uint64_t damaged = std::uint64_t{item.length} + 1;
     switch (form_of(type)) {
     case item_form::string: {
         const void * const p_terminator = std::memchr(item.p_bytes, 0, item.length);
         if (p_terminator == nullptr)
-            return false;
-        *p_length = static_cast<std::uint64_t>(static_cast<const std::byte *>(p_terminator) - item.p_bytes) + 1;
-        return true;
+            return damaged;
+        return static_cast<std::uint64_t>(static_cast<const std::byte *>(p_terminator) - item.p_bytes) + 1;
     }
     case item_form::binary:
-    case item_form::sbs:
         if (item.length < length_word_length)
-            return false;
-        *p_length = length_word_length + std::uint64_t{load<std::uint32_t, Order>(item.p_bytes)};
-        // A negative length of an SBS is a large one here, and has to be refused as such.
-        if (form_of(type) == item_form::sbs && *p_length > length_word_length + std::uint64_t{INT32_MAX})
-            return false;
-        break;
+            return damaged;
+        return length_word_length + std::uint64_t{load<std::uint32_t, Order>(item.p_bytes)};
+    case item_form::sbs: {
+        if (item.length < length_word_length)
+            return damaged;
+        const std::uint32_t length = load<std::uint32_t, Order>(item.p_bytes);
+        return length <= INT32_MAX ? length_word_length + std::uint64_t{length} : damaged;
+    }
     case item_form::handle:
-        *p_length = handle_length;
-        break;
+        return handle_length;
     case item_form::structured:
     case item_form::array:
-        if (item.length < list_head_length)
-            return false;
-        *p_length = slot_list_of<Order>(type, item.p_bytes).length();
-        break;
+        return item.length < list_head_length ? damaged : slot_list_of<Order>(type, item.p_bytes).length();
     case item_form::none:
     case item_form::word32:
     case item_form::word64:
-        return false;
+        break;
     }
-    return *p_length <= item.length;
+    return damaged;
 }
 
 // Checks the slots of an array or structured data whose own length is known to fit.
@@ -163,9 +160,9 @@ template <word_order Order>
 template <word_order Order>
 kt_int32_t check_item(kt_data_type_t type, stored_item item, unsigned level, client_measure * p_measure)
 {
-    const item_form form = form_of(type);
-    std::uint64_t   length;
-    if (level > KT_PMSG_MAXIMUM_NESTING || !own_length<Order>(type, item, &length))
+    const item_form form   = form_of(type);
+    std::uint64_t   length = own_length<Order>(type, item);
+    if (level > KT_PMSG_MAXIMUM_NESTING || length > item.length)
         return KT_PMSG_E_DAMAGED;
     if (p_measure != nullptr) {
         if (form == item_form::string)

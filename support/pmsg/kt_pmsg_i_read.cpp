@@ -89,8 +89,8 @@ void store_client_pointer(kt_value_t * p_value, const void * p_record)
 // The most frequent indirect value by far, so it takes the short way.
 [[nodiscard]] kt_int32_t read_string(stored_item item, const text_conversion & text, kt_value_t * p_value)
 {
-    std::uint64_t length;
-    if (!own_length<word_order::local>(KT_CHAR_PTR, item, &length))
+    std::uint64_t length = own_length<word_order::local>(KT_CHAR_PTR, item);
+    if (length > item.length)
         return KT_PMSG_E_DAMAGED;
 
     char * p_text = nullptr;
