@@ -76,13 +76,13 @@ enum class entry_id : kt_uint32_t {
 
 inline void rg_i_trace_entry(entry_id id)
 {
-    if (Rg_Trace_Level_Of_Detail[RG_I_TRACE_API] != 0)
+    if (rg_i_traces(RG_I_TRACE_API))
         tr_record_id_1(RG_I_TRACE_COMPONENT, static_cast<kt_uint32_t>(id));
 }
 
 inline void rg_i_trace_exit(entry_id id, kt_int32_t rc)
 {
-    if (Rg_Trace_Level_Of_Detail[RG_I_TRACE_API] != 0)
+    if (rg_i_traces(RG_I_TRACE_API))
         tr_record_values_32_1(RG_I_TRACE_COMPONENT, static_cast<kt_uint32_t>(id) + 1, 1, static_cast<kt_uint32_t>(rc));
 }
 

@@ -15,17 +15,23 @@
 
 #include "rg_i_read_write_lock.h"
 
+// code() is the result of the lock. Unlocks only what it locked.
 class mutex_guard
 {
   public:
-    explicit mutex_guard(pthread_mutex_t & mutex) : mutex_(mutex) { code_ = pthread_mutex_lock(&mutex_); }
-    ~mutex_guard() { pthread_mutex_unlock(&mutex_); }
-    mutex_guard(const mutex_guard &)             = delete;
-    mutex_guard & operator=(const mutex_guard &) = delete;
+    explicit mutex_guard(pthread_mutex_t & mutex) : mutex_(mutex), code_(pthread_mutex_lock(&mutex)) {}
+    ~mutex_guard()
+    {
+        if (code_ == 0)
+            pthread_mutex_unlock(&mutex_);
+    }
+    mutex_guard(const mutex_guard &)                 = delete;
+    mutex_guard &     operator=(const mutex_guard &) = delete;
+    [[nodiscard]] int code() const { return code_; }
 
   private:
     pthread_mutex_t & mutex_;
-    int               code_;
+    const int         code_;
 };
 
 // The read-write lock can fail to lock: look at code() first. Unlocks only what it locked.

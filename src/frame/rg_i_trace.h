@@ -5,6 +5,8 @@
 // Everybody above passes the code up unchanged. The functions here use the stack alone, so they run under any lock.
 #pragma once
 
+#include <atomic>
+
 #include "kt_rg.h"
 #include "kt_tr.h"
 
@@ -24,7 +26,14 @@ extern tr_category_description_t Rg_Trace_Categories[3];
 extern kt_uint32_t               Rg_Library_Registered_For_Trace;
 
 inline constexpr kt_char_t RG_I_TRACE_COMPONENT[] = "_RGA";
-enum { RG_I_TRACE_API = 0, RG_I_TRACE_ERRORS = 1 };
+enum { RG_I_TRACE_API = 0, RG_I_TRACE_ERRORS = 1, RG_I_TRACE_WHEREVER = 2 };
+
+// Whether events of the category are wanted. Read without a lock on purpose: a stale byte costs an event, or one too
+// many.
+[[nodiscard]] inline bool rg_i_traces(kt_uint32_t category)
+{
+    return std::atomic_ref(Rg_Trace_Level_Of_Detail[category]).load(std::memory_order_relaxed) != 0;
+}
 
 // Registers the component on the first call of the process.
 void rg_i_register_for_trace();
@@ -43,11 +52,19 @@ void rg_i_register_for_trace();
 // RG_E_INVALID_VARIABLE_TYPE, with the criteria in the message.
 [[nodiscard]] kt_int32_t rg_i_fail_invalid_variable(const rg_i_site_t & site, const kt_char_t * p_text);
 
+// Last witness of a failing flush: one line in the file reginfo_pid.<pid> of the working directory. Never fails.
 void rg_i_capture_errno(char * p_function_name, int the_errno, int line_number, char * p_sccsid);
-int  get_filesystem_containing_file(char * path, char * device, char * mount_directory);
-// Sets the record of code 16; the caller returns the code.
+
+// The mounted file system that holds the path: its device and directory, into buffers of RG_I_MOUNT_TEXT_SIZE bytes.
+// -1 if the table of mounts can't be read; the texts are "UNKNOWN" then. The second form reads /etc/mtab.
+inline constexpr int RG_I_MOUNT_TEXT_SIZE = 4096;
+int rg_i_find_filesystem(const char * p_table_of_mounts, const char * path, char * device, char * mount_directory);
+int get_filesystem_containing_file(char * path, char * device, char * mount_directory);
+
+// Sets the record of code 16; the caller returns the code. Without a site, the record of the error's place names the
+// function itself.
 void trace_filesystem_full_for_path(const rg_i_site_t & site, char * p_path);
 void trace_filesystem_full_for_path(char * p_path);
-// Sets the record of code 202 with the rendered key; the caller returns the code.
+// Sets the record of code 202 with the rendered key; the caller returns the code. The table's name may be NULL.
 void trace_key_not_found(const rg_i_site_t & site, char * p_table_name, kt_value_t value, kt_data_type_t type);
 void trace_key_not_found(char * p_table_name, kt_value_t value, kt_data_type_t type);
