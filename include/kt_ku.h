@@ -13,6 +13,15 @@ extern "C" {
 #endif
 #pragma GCC visibility push(default)
 
+/* What ku_get_locale_info_1 and the ku_iconv_ functions return on a failure. */
+enum {
+    KU_E_INVALID_ARGUMENT = 1,
+    KU_E_UNKNOWN_CODESET  = 2,
+    KU_E_NO_COUNTERPART   = 3,
+    KU_E_TOO_LONG         = 4,
+    KU_E_NO_MEMORY        = 5
+};
+
 /* ---- The error record ------------------------------------------------------------------------------------------ */
 
 typedef struct ku_error_record_t {

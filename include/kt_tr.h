@@ -12,6 +12,9 @@ extern "C" {
 #endif
 #pragma GCC visibility push(default)
 
+/* Failures of tr_set_level_1. */
+enum { TR_E_UNKNOWN_COMPONENT = 1, TR_E_UNKNOWN_CATEGORY = 2 };
+
 typedef kt_uint8_t tr_detail_level_t;
 
 typedef struct tr_category_description_t {
