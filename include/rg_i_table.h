@@ -195,6 +195,9 @@ void rg_i_dup_nonscalar_value(kt_data_type_t type, kt_value_t * p_from_value, kt
 }
 
 // ---- Making and destroying table objects (table/rg_i_create_table, table/rg_i_close_table; the tree's write lock) --
+//
+// Whoever is passed a hash table, here and in the storage section, owns it from the start: when the call returns a table
+// has it, or it has been closed, whatever the code. NULL: none.
 
 [[nodiscard]] kt_int32_t  rg_i_create_null_table(rg_i_table_t ** p_table);
 [[nodiscard]] kt_int32_t  rg_i_create_transient_table_common(rg_i_tree_t * p_tree, kt_char_ptr_t p_name,
