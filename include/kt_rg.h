@@ -178,12 +178,11 @@ kt_int32_t rg_abort_1(rg_opaque_handle_t table_handle);
  *   RG_E_KEY_EXPECTED         the key column isn't named
  *   RG_E_NO_COLUMNS           a name that no column has, or one that stands twice
  *   RG_E_DUPLICATE_KEY        a row has the key already (RG_PRIMARY_KEY only; see docs/ODDITIES.md on reused slots)
- *   RG_E_LIBRARY_CALL         a value can't be stored: a string that the table's encoding can't hold, or a broken
- * record RG_E_NO_MEMORY            no memory for the record, the index or the change RG_E_INTERNAL             in a
- * forked child, without an error record; or the hash function returned no bucket and on an implicitly controlled table
- * the codes of rg_apply_1, with the row taken back, and of rg_commit_1. Thread-safe; the updates of a process run one
- * at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
-
+ *   RG_E_LIBRARY_CALL         a value can't be stored: a string that the table's encoding lacks, or a broken record
+ *   RG_E_NO_MEMORY            no memory for the record, the index or the change
+ *   RG_E_INTERNAL             in a forked child, without an error record; or the hash function gave no bucket
+ * and on an implicitly controlled table the codes of rg_apply_1, with the row taken back, and of rg_commit_1.
+ * Thread-safe; the updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
 kt_int32_t rg_add_row_1(rg_opaque_handle_t table_handle, kt_char_ptr_t * p_column_names, kt_value_t ** p_p_fields,
                         kt_uint32_t total_values);
 
