@@ -253,6 +253,69 @@ kt_int32_t rg_get_fields_by_key_and_visibility_1(rg_opaque_handle_t table_handle
 kt_int32_t rg_get_fixed_row_index_for_key_1(rg_opaque_handle_t table_handle, kt_value_t key_value,
                                             kt_uint32_t * p_fixed_row_index);
 
+/* ---- Setting fields --------------------------------------------------------------------------------------------
+ *
+ * Replaces fields of a row in the table's pending state; on an implicitly controlled table the update is applied and
+ * committed as well. Rows are addressed as for reading, and an update always builds on the row's applied state.
+ *
+ *   column_name(s)  array_count names, each once; matched exactly
+ *   new_field(s)    the values, in the order of the names (called `result` in rg_set_field_by_key_1, and only read
+ *                   there). A NULL pointer inside a value of an indirect type stands for the type's empty value. The
+ *                   row holds a copy: the values stay the caller's
+ *
+ * A column that isn't named keeps its value, or takes its default if it is RG_SET_TO_DEFAULT_WHEN_UNSPECIFIED; so an
+ * array_count of 0 is a change too. The key can be set like any other column: there is no test for a duplicate, and on
+ * a hashed table the row stays in the bucket of its old key.
+ *
+ * Each returns 0 or, with nothing changed:
+ *   RG_E_INVALID_HANDLE       table_handle is NULL
+ *   RG_E_ACCESS               the table isn't open for writing
+ *   RG_E_NO_SUCH_KEY          no row has the key
+ *   RG_E_APPLIED_UNCOMMITTED  updates are applied and not committed
+ *   RG_E_NULL_POINTER         an array, a name or a value pointer is NULL; a NULL pointer as key
+ *   RG_E_NO_SUCH_INDEX        as for reading
+ *   RG_E_ROW_DELETED          the row has no applied record: its deletion is pending, or no row is at the index
+ *   RG_E_INVALID_COLUMN       a name of an RG_PROTECTED column, one that no column has, or one that stands twice
+ *   RG_E_LIBRARY_CALL         a value can't be stored: a string that the table's encoding lacks, or a broken record
+ *   RG_E_TABLE_UNREADABLE     a value that would be kept leads outside the row: the table's file is damaged
+ *   RG_E_NO_MEMORY            no memory for the record or the change
+ *   RG_E_INTERNAL             in a forked child, without an error record; or the hash function gave no bucket
+ * and on an implicitly controlled table the codes of rg_apply_1, with the update taken back, and of rg_commit_1.
+ * Thread-safe; the updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
+
+kt_int32_t rg_set_field_by_index_1(rg_opaque_handle_t table_handle, kt_int32_t row_index, kt_char_ptr_t column_name,
+                                   kt_value_t * new_field);
+kt_int32_t rg_set_field_by_fixed_index_1(rg_opaque_handle_t table_handle, kt_int32_t fixed_row_index,
+                                         kt_char_ptr_t column_name, kt_value_t * new_field);
+kt_int32_t rg_set_field_by_key_1(rg_opaque_handle_t table_handle, kt_value_t row_key, kt_char_ptr_t column_name,
+                                 kt_value_t * result);
+kt_int32_t rg_set_fields_by_index_1(rg_opaque_handle_t table_handle, kt_int32_t row_index, kt_char_ptr_t * column_names,
+                                    kt_value_t ** new_fields, kt_uint32_t array_count);
+kt_int32_t rg_set_fields_by_fixed_index_1(rg_opaque_handle_t table_handle, kt_int32_t fixed_row_index,
+                                          kt_char_ptr_t * column_names, kt_value_t ** new_fields,
+                                          kt_uint32_t array_count);
+kt_int32_t rg_set_fields_by_key_1(rg_opaque_handle_t table_handle, kt_value_t row_key, kt_char_ptr_t * column_names,
+                                  kt_value_t ** new_values, kt_uint32_t array_count);
+
+/* ---- Deleting rows --------------------------------------------------------------------------------------------- */
+
+/* Deletes the row at a packed index in the table's pending state; on an implicitly controlled table the deletion is
+ * applied and committed as well. The row's indices stay until commit, so that rows can be deleted one after the other
+ * in one transaction without their positions shifting.
+ *
+ * Returns 0 or, with nothing changed:
+ *   RG_E_INVALID_HANDLE  table_handle is NULL
+ *   RG_E_ACCESS          the table isn't open for writing
+ *   RG_E_NO_SUCH_INDEX   row_index is not below the number of rows
+ *   RG_E_ROW_DELETED     the row's deletion is pending already
+ *   RG_E_NO_MEMORY       no memory for the change
+ *   RG_E_INTERNAL        in a forked child, without an error record
+ * and on an implicitly controlled table the codes of rg_apply_1, with the deletion taken back, and of rg_commit_1.
+ * Between apply and commit the call goes through, unlike any other update: the deletion then takes part in the commit
+ * in memory without being in the file. Thread-safe; the updates of a process run one at a time. See
+ * docs/ARCHITECTURE.md. */
+kt_int32_t rg_delete_row_by_index_1(rg_opaque_handle_t table_handle, kt_uint32_t row_index);
+
 /* ---- The application's own data -------------------------------------------------------------------------------- */
 
 kt_int32_t rg_set_application_metadata_1(rg_opaque_handle_t table_handle, kt_binary_t * p_binary);

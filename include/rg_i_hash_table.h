@@ -40,4 +40,9 @@ kt_int32_t               rg_i_hash_table_close(rg_hash_table_t * p_hash_table);
 [[nodiscard]] kt_int32_t rg_i_hash_table_remove(rg_hash_table_t * p_hash_table, kt_char_ptr_t p_key_value);
 [[nodiscard]] kt_int32_t rg_i_hash_table_remove_element(rg_hash_table_t * p_hash_table, kt_uint32_t hash_index,
                                                         rg_hash_table_element_t * p_hash_table_element);
+// Puts an element with its own copy of the key in the element's place in the bucket, for a key whose row record goes
+// away ahead of its row. The former element is gone; its neighbours and their order stay.
+[[nodiscard]] kt_int32_t rg_i_hash_table_own_key(rg_hash_table_t * p_hash_table, kt_uint32_t hash_index,
+                                                 kt_uint32_t                key_length,
+                                                 rg_hash_table_element_t ** p_p_hash_table_element);
 void                     rg_i_hash_table_output_stats(rg_hash_table_t * p_hash_table);

@@ -267,8 +267,7 @@ kt_int32_t                rg_i_abort(rg_i_table_t * p_table);
                                           kt_value_t * p_input_key_value, rg_i_index_entry_t ** p_p_new_index_entry,
                                           rg_hash_table_element_t ** p_p_existing_hash_table_element);
 
-// ---- Reading (rows/rg_i_get_values; read lock)
-// -----------------------------------------------------------------------
+// ---- Reading (rows/rg_i_get_values; read lock) ---------------------------------------------------------------------
 
 // Client value against stored value: -1, 0, 1 (any sign for strings and handles). A stored value that leaves the
 // indirect data of indirect_length bytes equals nothing.
@@ -305,3 +304,26 @@ kt_int32_t                rg_i_abort(rg_i_table_t * p_table);
 [[nodiscard]] kt_int32_t rg_i_get_fixed_row_index_for_key(rg_i_table_t * p_table, kt_value_t row_key,
                                                           kt_uint32_t * p_fixed_row_index);
 [[nodiscard]] rg_row_state_t rg_i_get_row_state_for_fixed_index(rg_i_table_t * p_table, kt_uint32_t fixed_row_index);
+
+// ---- Setting fields (rows/rg_i_set_values; write lock) -------------------------------------------------------------
+
+[[nodiscard]] kt_int32_t rg_i_set_value_for_fixed_index(rg_i_table_t * p_table, kt_uint32_t fixed_row_index,
+                                                        kt_char_ptr_t p_column_name, kt_value_t * p_value);
+[[nodiscard]] kt_int32_t rg_i_set_values_for_fixed_index(rg_i_table_t * p_table, kt_uint32_t fixed_row_index,
+                                                         kt_char_ptr_t * p_column_names, kt_value_t ** p_p_values,
+                                                         kt_uint32_t total_values);
+[[nodiscard]] kt_int32_t rg_i_set_value_for_packed_index(rg_i_table_t * p_table, kt_uint32_t row_index,
+                                                         kt_char_ptr_t p_column_name, kt_value_t * p_value);
+[[nodiscard]] kt_int32_t rg_i_set_values_for_packed_index(rg_i_table_t * p_table, kt_uint32_t row_index,
+                                                          kt_char_ptr_t * p_column_names, kt_value_t ** p_p_values,
+                                                          kt_uint32_t total_values);
+[[nodiscard]] kt_int32_t rg_i_set_value_for_key(rg_i_table_t * p_table, kt_value_t row_key, kt_char_ptr_t p_column_name,
+                                                kt_value_t * p_value);
+[[nodiscard]] kt_int32_t rg_i_set_values_for_key(rg_i_table_t * p_table, kt_value_t row_key,
+                                                 kt_char_ptr_t * p_column_names, kt_value_t ** p_p_values,
+                                                 kt_uint32_t total_values);
+
+// ---- Deleting rows (rows/rg_i_delete_rows; write lock) -------------------------------------------------------------
+
+// RG_E_ROW_DELETED, with nothing changed, if the row's deletion is pending already.
+[[nodiscard]] kt_int32_t rg_i_delete_row(rg_i_table_t * p_table, rg_i_index_entry_t * p_current_index_entry);

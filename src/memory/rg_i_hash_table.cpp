@@ -163,6 +163,29 @@ kt_int32_t rg_i_hash_table_remove_element(rg_hash_table_t * p_hash_table, kt_uin
     return rg_i_fail(RG_HERE, RG_E_NO_SUCH_KEY);
 }
 
+kt_int32_t rg_i_hash_table_own_key(rg_hash_table_t * p_hash_table, kt_uint32_t hash_index, kt_uint32_t key_length,
+                                   rg_hash_table_element_t ** p_p_hash_table_element)
+{
+    element_t ** p_link = &p_hash_table->p_elements[hash_index];
+    while (*p_link != nullptr && *p_link != *p_p_hash_table_element)
+        p_link = &(*p_link)->p_next;
+    element_t * const p_former = *p_link;
+    if (p_former == nullptr)
+        return rg_i_fail(RG_HERE, RG_E_NO_SUCH_KEY);
+    auto * const p_element = static_cast<element_t *>(std::malloc(sizeof(element_t) + key_length));
+    if (p_element == nullptr)
+        return rg_i_fail_no_memory(RG_HERE);
+
+    // Nothing below fails.
+    auto * const p_key = reinterpret_cast<kt_char_ptr_t>(p_element + 1);
+    std::memcpy(p_key, p_former->p_key_value, key_length);
+    *p_element              = {p_former->row_index, p_key, p_former->p_next};
+    *p_link                 = p_element;
+    *p_p_hash_table_element = p_element;
+    std::free(p_former);
+    return 0;
+}
+
 void rg_i_hash_table_output_stats(rg_hash_table_t * p_hash_table)
 {
     kt_uint32_t max_bucket_count = 0;

@@ -3,7 +3,8 @@
 //
 // Layer: rows. Stands on the record pool and the value library.
 // Always holds: every byte that is taken is written here, so that the room that is lent needn't be zeroed and a record
-// costs the same whatever free record it is built in.
+// costs the same whatever free record it is built in. Nothing behind the record so far has been written: a value that
+// the value library refuses, or has no room for, leaves no byte behind.
 // Locking: the caller holds the table's write lock, from opening to taking or abandoning.
 // Failure: the record stays to be abandoned by whoever opened it; only a failed opening leaves nothing.
 #include "rows/rg_i_row_builder.h"
@@ -40,12 +41,11 @@ constexpr char module_version[] = "rg_i_row_builder 1.0";
 
     if (row.p_record != nullptr && row.p_record != p_room) {
         std::memcpy(p_room, row.p_record, length_so_far(row));
-        rg_i_rb_give_back_record(p_pool, row.p_record, row.written);
+        rg_i_rb_give_back_record(p_pool, row.p_record, length_so_far(row));
     }
     row.p_record               = p_room;
     row.p_previous_free_record = p_previous_free_record;
     row.capacity               = capacity;
-    row.written                = length_so_far(row);
     return 0;
 }
 
@@ -91,14 +91,10 @@ kt_int32_t rg_i_row_builder_store_value(rg_i_row_builder_t * p_row, kt_uint32_t 
         const kt_int32_t result = kt_pmsg_build_conv_protocol_value_1(
             row.p_string_conversion_handle, 0, type, &value, rg_i_row_slot(row.p_record, column), indirect_data(row),
             row.capacity - row.fixed_length, &row.running_offset);
-        if (result == 0) {
-            row.written = length_so_far(row);
+        if (result == 0)
             return 0;
-        }
-        if (result != KT_PMSG_E_NO_ROOM) {
-            row.written = row.capacity; // part of the item may have been written, and nothing tells how much
+        if (result != KT_PMSG_E_NO_ROOM)
             return rg_i_fail_library_call(RG_HERE, "kt_pmsg_build_conv_protocol_value", result);
-        }
         if (const kt_int32_t rc = acquire_doubled_row_record(row); rc != 0)
             return rc;
     }
@@ -124,7 +120,6 @@ kt_int32_t rg_i_row_builder_carry_value(rg_i_row_builder_t * p_row, kt_uint32_t 
         std::memcpy(indirect_data(row) + row.running_offset, p_indirect_data + anchor.offset, anchor.length);
         anchor.offset = row.running_offset;
         row.running_offset += anchor.length;
-        row.written = length_so_far(row);
     }
     std::memcpy(rg_i_row_slot(row.p_record, column), &stored, sizeof stored);
     return 0;
@@ -139,5 +134,5 @@ kt_int32_t rg_i_row_builder_take(rg_i_row_builder_t * p_row, kt_uint32_t replace
 
 void rg_i_row_builder_abandon(rg_i_row_builder_t * p_row)
 {
-    rg_i_rb_give_back_record(&p_row->p_table->record_buffer_pool, p_row->p_record, p_row->written);
+    rg_i_rb_give_back_record(&p_row->p_table->record_buffer_pool, p_row->p_record, length_so_far(*p_row));
 }

@@ -17,7 +17,6 @@ struct rg_i_row_builder_t {
     kt_char_ptr_t  p_previous_free_record;
     kt_uint32_t    capacity;       // bytes of data that the room takes
     kt_uint32_t    running_offset; // bytes of indirect data so far
-    kt_uint32_t    written;        // bytes of the room that may have been written
 };
 
 // Starts a record in room of at least so many bytes, which must cover the fixed part.
