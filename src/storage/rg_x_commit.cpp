@@ -1,0 +1,16 @@
+// SPDX-License-Identifier: MIT
+// rg_x_commit: the exported call of rg_i_commit.
+#include "frame/rg_i_call_frame.h"
+
+namespace
+{
+
+constexpr char module_version[] = "rg_x_commit 1.0";
+
+} // namespace
+
+kt_int32_t rg_commit_1(rg_opaque_handle_t table_handle)
+{
+    return rg_i_transaction_call<entry_id::commit>(RG_HERE, table_handle,
+                                                   [](rg_i_table_t & table) { return rg_i_commit(&table); });
+}
