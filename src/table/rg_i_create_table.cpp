@@ -16,6 +16,7 @@
 #include "frame/rg_i_guards.h"
 #include "frame/rg_i_trace.h"
 #include "rg_i_table.h"
+#include "storage/rg_i_disk_format.h"
 
 namespace
 {
@@ -27,29 +28,10 @@ constexpr kt_uint32_t rows_to_start_with         = 100;
 constexpr kt_uint32_t default_data_to_start_with = 4096;
 constexpr kt_uint32_t qualifier_kind_mask        = 15;
 
-// The metadata record: a head of four words, the columns, and the variable region.
-constexpr kt_uint32_t metadata_head_length                    = 16;
-constexpr kt_uint32_t metadata_big_endian_offset              = 0;
-constexpr kt_uint32_t metadata_columns_offset                 = 8;
-constexpr kt_uint32_t metadata_variable_length_columns_offset = 12;
-
-// Its form in the file: shorter record heads, and columns that hold offsets in place of pointers.
-constexpr kt_uint32_t disk_record_head_length = 12;
-constexpr kt_uint32_t disk_column_length      = 28;
-constexpr kt_uint32_t disk_name_offset        = 0;
-constexpr kt_uint32_t disk_type_offset        = 4;
-constexpr kt_uint32_t disk_qualifier_offset   = 8;
-constexpr kt_uint32_t disk_properties_offset  = 12;
-constexpr kt_uint32_t disk_sd_defn_offset     = 16;
-constexpr kt_uint32_t disk_default_offset     = 20;
-constexpr kt_uint32_t disk_record_type_offset = 8;
-constexpr kt_uint32_t sd_definition_head      = 4; // number_of_fields
-constexpr kt_uint32_t sd_field_head           = 4; // the field's type; its name follows
-constexpr kt_uint32_t sd_definition_spare     = 4; // reserved with each definition, and left zero
-
-static_assert(RG_I_RECORD_HEAD_LENGTH - disk_record_head_length == 8);
-static_assert(sizeof(rg_column_t) - disk_column_length == 12);
-static_assert(disk_default_offset + sizeof(kt_value_t) == disk_column_length);
+constexpr kt_uint32_t metadata_head_length = sizeof(rg_i_metadata_head_t);
+constexpr kt_uint32_t sd_definition_head   = sizeof(rg_disk_sd_def_t);
+constexpr kt_uint32_t sd_definition_spare  = 4; // reserved with each definition, and left zero
+constexpr kt_uint32_t sd_field_head        = offsetof(disk_field_def, name_char_array);
 
 [[nodiscard]] bool is_key_kind(kt_uint32_t kind)
 {
@@ -178,9 +160,8 @@ void fill_metadata(rg_i_table_t * p_table, const rg_column_t * p_columns, kt_uin
     kt_char_ptr_t p_head   = p_table->p_metadata_record_data;
     p_table->p_columns     = reinterpret_cast<rg_column_t *>(p_head + metadata_head_length);
     p_table->total_columns = total_columns;
-    rg_i_store_u32(p_head + metadata_big_endian_offset, host_is_big_endian());
-    rg_i_store_u32(p_head + metadata_columns_offset, total_columns);
-    rg_i_store_u32(p_head + metadata_variable_length_columns_offset, p_table->total_variable_length_columns);
+    rg_i_store(p_head,
+               rg_i_metadata_head_t{host_is_big_endian(), 0, total_columns, p_table->total_variable_length_columns});
     std::memcpy(p_table->p_columns, p_columns, total_columns * sizeof *p_columns);
 
     kt_char_ptr_t p_end = rg_i_default_data(p_table);
@@ -255,6 +236,20 @@ void fill_metadata(rg_i_table_t * p_table, const rg_column_t * p_columns, kt_uin
     if (const kt_int32_t rc = build_metadata(p_table, p_columns, total_columns); rc != 0)
         return rc;
     return give_hash_table_and_blob(p_table);
+}
+
+// A column as the file holds it: offsets from the start of the variable region in place of pointers.
+[[nodiscard]] rg_disk_column_t disk_column(const rg_column_t & column, const kt_char_t * p_region)
+{
+    rg_disk_column_t to{};
+    to.name_offset = static_cast<kt_uint32_t>(column.name - p_region);
+    to.type        = column.type;
+    to.qualifier   = column.qualifier;
+    to.properties  = column.properties;
+    if (column.sd_defn != nullptr)
+        to.sd_defn_offset = static_cast<kt_uint32_t>(reinterpret_cast<const kt_char_t *>(column.sd_defn) - p_region);
+    std::memcpy(to.default_value, &column.default_value, sizeof to.default_value);
+    return to;
 }
 
 } // namespace
@@ -429,35 +424,24 @@ kt_int32_t rg_i_create_transient_table(rg_i_tree_t * p_tree, kt_char_ptr_t p_nam
 kt_int32_t rg_i_convert_metadata_memory_record_to_disk_record(kt_char_ptr_t   p_mem_record,
                                                               kt_char_ptr_t * p_p_disk_metadata_record)
 {
-    kt_char_ptr_t     p_mem_data    = p_mem_record + RG_I_RECORD_HEAD_LENGTH;
-    const kt_uint32_t total_columns = rg_i_load_u32(p_mem_data + metadata_columns_offset);
-    const kt_uint32_t mem_length    = rg_i_load_u32(p_mem_record + offsetof(rg_i_record_metadata_t, record_length));
-    const kt_uint32_t disk_length   = mem_length - 8 - 12 * total_columns;
+    const kt_uint32_t mem_length = rg_i_load<rg_i_record_metadata_t>(p_mem_record).record_length;
+    kt_char_ptr_t     p_mem_data = p_mem_record + RG_I_RECORD_HEAD_LENGTH;
+    const auto        head       = rg_i_load<rg_i_metadata_head_t>(p_mem_data);
+    const kt_uint32_t disk_length =
+        mem_length - RG_I_MEMORY_RECORD_EXCESS - RG_I_MEMORY_COLUMN_EXCESS * head.total_columns;
 
     auto * p_disk_record = static_cast<kt_char_ptr_t>(std::calloc(1, disk_length));
     if (p_disk_record == nullptr)
         return rg_i_fail_no_memory(RG_HERE);
+    rg_i_store(p_disk_record, rg_i_disk_metadata_record_t{{disk_length, 0, RG_RECORD_TYPE_METADATA}, head});
 
-    rg_i_store_u32(p_disk_record, disk_length);
-    rg_i_store_u32(p_disk_record + disk_record_type_offset, RG_RECORD_TYPE_METADATA);
-    std::memcpy(p_disk_record + disk_record_head_length, p_mem_data, metadata_head_length);
-
-    const auto *  p_columns     = reinterpret_cast<const rg_column_t *>(p_mem_data + metadata_head_length);
-    const auto *  p_region      = reinterpret_cast<const kt_char_t *>(p_columns + total_columns);
-    kt_char_ptr_t p_disk_column = p_disk_record + disk_record_head_length + metadata_head_length;
-    for (kt_uint32_t column = 0; column < total_columns; ++column, p_disk_column += disk_column_length) {
-        const rg_column_t & from = p_columns[column];
-        rg_i_store_u32(p_disk_column + disk_name_offset, static_cast<kt_uint32_t>(from.name - p_region));
-        rg_i_store_u32(p_disk_column + disk_type_offset, from.type);
-        rg_i_store_u32(p_disk_column + disk_qualifier_offset, from.qualifier);
-        std::memcpy(p_disk_column + disk_properties_offset, &from.properties, sizeof from.properties);
-        if (from.sd_defn != nullptr)
-            rg_i_store_u32(p_disk_column + disk_sd_defn_offset,
-                           static_cast<kt_uint32_t>(reinterpret_cast<const kt_char_t *>(from.sd_defn) - p_region));
-        std::memcpy(p_disk_column + disk_default_offset, &from.default_value, sizeof from.default_value);
-    }
+    const auto *  p_columns = reinterpret_cast<const rg_column_t *>(p_mem_data + metadata_head_length);
+    const auto *  p_region  = reinterpret_cast<const kt_char_t *>(p_columns + head.total_columns);
+    kt_char_ptr_t p_to      = p_disk_record + sizeof(rg_i_disk_metadata_record_t);
+    for (kt_uint32_t column = 0; column < head.total_columns; ++column, p_to += sizeof(rg_disk_column_t))
+        rg_i_store(p_to, disk_column(p_columns[column], p_region));
     // Behind the columns the two forms are byte for byte the same, the spare zeros at the end included.
-    std::memcpy(p_disk_column, p_region, static_cast<size_t>(p_disk_record + disk_length - p_disk_column));
+    std::memcpy(p_to, p_region, static_cast<size_t>(p_disk_record + disk_length - p_to));
     *p_p_disk_metadata_record = p_disk_record;
     return 0;
 }

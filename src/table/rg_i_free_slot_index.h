@@ -2,9 +2,9 @@
 // rg_i_free_slot_index: which slots of a row index are free, as a set that finds the nearest free slot below another in
 // a few steps, so that the free chain can stay sorted without being walked.
 //
-// One bit a slot, 64 to a word, and above each level of words one bit a word that isn't zero, up to a level of one word.
-// The words lie behind the slots, in the allocation of the slots: they move, and are exchanged, with them. They know
-// nothing of the chain: rg_i_table keeps the two in step. Nothing here fails or allocates.
+// One bit a slot, 64 to a word, and above each level of words one bit a word that isn't zero, up to a level of one
+// word. The words lie behind the slots, in the allocation of the slots: they move, and are exchanged, with them. They
+// know nothing of the chain: rg_i_table keeps the two in step. Nothing here fails or allocates.
 #pragma once
 
 #include <cstddef>
