@@ -138,19 +138,103 @@ kt_int32_t rg_unmount_local_tree_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t
 
 /* ---- Creating, opening and closing tables ---------------------------------------------------------------------- */
 
+/* Makes a table at a registry path and opens it for writing. Under a mount point the table gets a file, which is there
+ * whole or not at all; elsewhere it lives in the tree's memory until it is deleted or the tree is closed.
+ *
+ *   p_registry_path  1 to 255 letters, digits, '_' and '/'
+ *   p_columns        array_count columns, exactly one of them with a key qualifier. A key is a number, a string or a
+ *                    resource handle. The key column becomes column 0 of the table by changing places with the first
+ *                    one. The library copies what it keeps, but it writes over the array: the default_value of each
+ *                    column of an indirect type (KT_CHAR_PTR to KT_SD_PTR_ARRAY) holds no pointer afterwards, whether
+ *                    the creation succeeded or not, unless the columns themselves were refused. Fill those in again
+ *                    before the array is used again
+ *   mode             0 to 7; only RG_MODE_EXPLICIT_CONTROL counts
+ *   p_result_table_handle  gets the handle on success, for rg_close_table_1
+ *
+ * Returns 0 or, with nothing made:
+ *   RG_E_INVALID_HANDLE    tree_handle is NULL
+ *   RG_E_NULL_POINTER      p_result_table_handle or p_columns is NULL
+ *   RG_E_INVALID_MODE      mode is below 0 or above 7
+ *   RG_E_INVALID_PATH      the path can't be one
+ *   RG_E_TABLE_EXISTS      the table is in the tree, its file exists, or it can't be told whether it does
+ *   RG_E_NO_COLUMNS        array_count is 0
+ *   RG_E_INVALID_COLUMN    a name that isn't a letter and up to 254 letters, digits and '_'; a type or qualifier that
+ * no column can have; structured data without a definition or with a nameless field; a key of a type that no key can
+ * have RG_E_KEY_EXPECTED      no key column RG_E_DUPLICATE_KEY     more than one key column RG_E_DUPLICATE_COLUMN  two
+ * columns of one name RG_E_LIBRARY_CALL      a default can't be stored: a string that the table's encoding lacks, or a
+ * broken record RG_E_NO_MEMORY         no memory. If it ran out behind the last step of a table with a file, the file
+ * is there RG_E_ACCESS            no permission to make the file RG_E_FILESYSTEM_FULL_DETAIL, RG_E_SYSTEM_CALL  the
+ * file could not be written RG_E_INTERNAL          in a forked child, without an error record Thread-safe; creations
+ * and updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/FILE-FORMAT.md, docs/BAD-INPUT.md. */
 kt_int32_t rg_create_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path, rg_column_t * p_columns,
                              kt_uint32_t array_count, kt_int32_t mode, rg_opaque_handle_t * p_result_table_handle);
+/* The same, for a table whose rows are found by key through a hash table. A table keyed by resource handle has one
+ * without this call.
+ *
+ *   total_hash_buckets  fixed while the table is open; not 0. The hash table isn't part of a file: rg_open_table_1
+ * opens the table without one p_hash_function     gives the bucket of a key, below total_hash_buckets
+ *   p_compare_function  0 if two keys are equal
+ *
+ * The two functions are called with the table locked, so they must not call the library on that table; the address of
+ * a key may have any alignment.
+ *
+ * Returns the codes above, and RG_E_NULL_POINTER, ahead of all but the forked child's code, if total_hash_buckets is 0
+ * or a function is NULL. */
 kt_int32_t rg_create_hashed_key_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path,
                                         rg_column_t * p_columns, kt_uint32_t array_count, kt_int32_t mode,
                                         kt_uint32_t total_hash_buckets, rg_hash_function_t * p_hash_function,
                                         rg_hash_keys_compare_function_t * p_compare_function,
                                         rg_opaque_handle_t *              p_result_table_handle);
+/* Opens a table that exists: one in the tree's memory, or the file at a path under a mount point. All opens of a table
+ * in a tree share one object, so mode and control are the table's, not the handle's:
+ *
+ *   - a reader that joins changes nothing, and its handle can update if the table is open for writing;
+ *   - a writer that joins writers must ask for the same control;
+ *   - a writer that joins readers of a table with a file makes everybody a writer: the file is read afresh into the
+ *     shared object, without its hash table unless rg_open_hashed_key_table_1 brings one, and row indices are assigned
+ *     anew. The application's data stays what the object had;
+ *   - who opens a transient table that nobody has open decides alone.
+ *
+ *   mode  RG_MODE_READ, or RG_MODE_WRITE with or without RG_MODE_EXPLICIT_CONTROL; RG_MODE_READ beside
+ *         RG_MODE_WRITE means nothing. Opening a file for writing waits until no other process has it open for
+ *         writing, with the tree locked; it holds the file's lock until the last handle is closed
+ *   p_result_table_handle  gets the handle on success, for rg_close_table_1
+ *
+ * Returns 0 or:
+ *   RG_E_INVALID_HANDLE    tree_handle is NULL
+ *   RG_E_NULL_POINTER      p_result_table_handle is NULL
+ *   RG_E_INVALID_MODE      mode is 0, 4, 5, below 0 or above 7
+ *   RG_E_INVALID_PATH      the path can't be one
+ *   RG_E_NO_SUCH_TABLE     no such table in the tree, and no file
+ *   RG_E_EXCLUSIVE_OPEN    the table is open for writing with the other control
+ *   RG_E_ACCESS            no permission to open the file
+ *   RG_E_TABLE_UNREADABLE, RG_E_BAD_REPLACES_OFFSET, RG_E_BAD_DELETED_ROW_OFFSET, RG_E_NO_COMMIT_RECORD
+ *                          the file is damaged, or isn't a table
+ *   RG_E_NO_MEMORY, RG_E_SYSTEM_CALL, RG_E_FILESYSTEM_FULL_DETAIL  the file could not be opened or read
+ * A failure leaves everything as it was, except that a writer that joins readers and fails to read the file leaves its
+ * open counted: the table then stays in the tree until the tree is closed.
+ * Thread-safe; opens in a tree run one at a time. A forked child may open. See docs/ARCHITECTURE.md,
+ * docs/BAD-INPUT.md. */
 kt_int32_t rg_open_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path, kt_int32_t mode,
                            rg_opaque_handle_t * p_result_table_handle);
+/* The same, and if a file is read its rows are found by key through a hash table, as in rg_create_hashed_key_table_1. A
+ * table that is in memory keeps what it has, and the arguments are checked and forgotten.
+ *
+ * Returns the codes above, and:
+ *   RG_E_NULL_POINTER   total_hash_buckets is 0 or a function is NULL: ahead of everything else
+ *   RG_E_DUPLICATE_KEY  two rows of the file have one key, though it is RG_PRIMARY_KEY; without an error record
+ *   RG_E_INTERNAL       the hash function returned no bucket */
 kt_int32_t rg_open_hashed_key_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path, kt_int32_t mode,
                                       kt_uint32_t total_hash_buckets, rg_hash_function_t * p_hash_function,
                                       rg_hash_keys_compare_function_t * p_compare_function,
                                       rg_opaque_handle_t *              p_result_table_handle);
+/* Gives a handle back. The last one on a table with a file takes the table out of memory; what is pending or applied is
+ * dropped, and the file stays at its last commit. A transient table stays in its tree with its rows.
+ *
+ * A handle must not be used or closed again, nor be closed while another thread uses it: that isn't noticed.
+ *
+ * Returns 0; RG_E_INVALID_HANDLE if table_handle is NULL; RG_E_SYSTEM_CALL if the tree can't be locked, and then the
+ * handle stays open. Thread-safe for handles of different tables. See docs/ARCHITECTURE.md. */
 kt_int32_t rg_close_table_1(rg_opaque_handle_t table_handle);
 
 /* ---- Transactions ---------------------------------------------------------------------------------------------- */
@@ -318,7 +402,35 @@ kt_int32_t rg_delete_row_by_index_1(rg_opaque_handle_t table_handle, kt_uint32_t
 
 /* ---- The application's own data -------------------------------------------------------------------------------- */
 
+/* A table carries one binary of the application's beside its rows. It is applied, committed and aborted with them, and
+ * stands in the file's commit record, so that it changes atomically with the rows. */
+
+/* Gives the table a new version of the binary: pending, or on an implicitly controlled table applied and committed.
+ *
+ *   p_binary  copied; a length of 0 is a binary too
+ *
+ * Returns 0 or, with nothing changed:
+ *   RG_E_INVALID_HANDLE  table_handle is NULL
+ *   RG_E_NULL_POINTER    p_binary is NULL
+ *   RG_E_ACCESS          the table isn't open for writing
+ *   RG_E_NO_MEMORY       no memory for the copy
+ *   RG_E_INTERNAL        in a forked child, without an error record
+ * and on an implicitly controlled table the codes of rg_apply_1, with the binary taken back, and of rg_commit_1. With
+ * explicit control the call goes through while an apply is outstanding: the commit then takes a binary that isn't in
+ * the file. Thread-safe; the updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
 kt_int32_t rg_set_application_metadata_1(rg_opaque_handle_t table_handle, kt_binary_t * p_binary);
+/* Delivers a copy of the committed binary, or of the pending one if the table was made with
+ * RG_UNCOMMITTED_UPDATES_VISIBLE in the environment.
+ *
+ *   p_p_binary  gets a block that belongs to the caller, who releases it with free
+ *
+ * Returns 0 or, with *p_p_binary as it was:
+ *   RG_E_INVALID_HANDLE  table_handle is NULL
+ *   RG_E_NULL_POINTER    p_p_binary is NULL
+ *   RG_E_NO_SUCH_KEY     the table has no binary, or none that is committed
+ *   RG_E_ROW_DELETED     the binary's deletion is pending and visible; no call of this interface makes one
+ *   RG_E_NO_MEMORY       no memory for the copy
+ * Thread-safe: any number of readers run together, in a forked child too. See docs/ARCHITECTURE.md. */
 kt_int32_t rg_get_application_metadata_1(rg_opaque_handle_t table_handle, kt_binary_t ** p_p_binary);
 
 #pragma GCC visibility pop
