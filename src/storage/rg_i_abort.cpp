@@ -12,6 +12,7 @@
 #include "frame/rg_i_trace.h"
 #include "rg_i_table.h"
 #include "storage/rg_i_files.h"
+#include "storage/rg_i_table_file.h"
 
 namespace
 {
@@ -27,9 +28,7 @@ void trace(const rg_i_table_t & table, int site)
 
 void throw_rewrite_file_away(rg_i_table_t & table)
 {
-    close(table.rewrite_file_fd); // -1 after a failed rewrite commit
-    table.rewrite_file_fd = -1;
-    unlink(rg_i_set_rewrite_path(&table));
+    rg_i_give_up_rewrite_file(&table); // there is none any more after a failed rewrite commit
     table.rewrite_file_length = 0;
 }
 

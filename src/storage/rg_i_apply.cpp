@@ -20,6 +20,7 @@
 #include "rg_i_table.h"
 #include "storage/rg_i_disk_format.h"
 #include "storage/rg_i_files.h"
+#include "storage/rg_i_table_file.h"
 
 namespace
 {
@@ -186,14 +187,6 @@ void build_row_record(const apply_t & apply, rg_i_index_entry_t & entry, kt_char
 
 // ---- Rewriting ----
 
-// Also where an append can't get its row buffer.
-void give_up_rewrite_file(rg_i_table_t & table)
-{
-    close(table.rewrite_file_fd);
-    table.rewrite_file_fd = -1;
-    unlink(rg_i_set_rewrite_path(&table));
-}
-
 [[nodiscard]] kt_int32_t full_is_reported(rg_i_table_t & table, kt_int32_t rc)
 {
     if (rc == RG_E_FILESYSTEM_FULL_DETAIL)
@@ -257,7 +250,7 @@ void give_up_rewrite_file(rg_i_table_t & table)
         return rc;
     const kt_int32_t rc = fill_rewrite_file(apply);
     if (rc != 0)
-        give_up_rewrite_file(apply.table);
+        rg_i_give_up_rewrite_file(&apply.table);
     return rc;
 }
 
@@ -328,7 +321,7 @@ void build_deleted_rows_record(const apply_t & apply, kt_uint32_t count)
         if (!allocate_rows(apply, rows_length)) {
             // Kept because callers depend on it: an append that gets no memory for its rows takes a stale rewrite file
             // away as well. Its own descriptor isn't touched.
-            give_up_rewrite_file(table);
+            rg_i_give_up_rewrite_file(&table);
             return leave(apply, __LINE__, rg_i_fail_no_memory(RG_HERE));
         }
         if (const kt_int32_t rc = write_rows(apply, writer); rc != 0)

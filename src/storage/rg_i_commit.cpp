@@ -19,6 +19,7 @@
 #include "rg_i_table.h"
 #include "storage/rg_i_disk_format.h"
 #include "storage/rg_i_files.h"
+#include "storage/rg_i_table_file.h"
 
 // The assertions of this file are part of what commit does: they hold in release builds too.
 #undef NDEBUG
@@ -117,13 +118,6 @@ void report_full(rg_i_table_t & table, kt_int32_t rc)
 
 // ---- The rewritten file ----
 
-void give_up_rewrite_file(rg_i_table_t & table)
-{
-    close(table.rewrite_file_fd);
-    table.rewrite_file_fd = -1;
-    unlink(rg_i_set_rewrite_path(&table));
-}
-
 [[nodiscard]] kt_int32_t rename_failure(commit_t & commit, int the_errno)
 {
     if (the_errno == EACCES)
@@ -143,12 +137,12 @@ void give_up_rewrite_file(rg_i_table_t & table)
     const owned_buffer rewrite_path(strdup(rg_i_set_rewrite_path(&table)));
     if (!rewrite_path) {
         const kt_int32_t rc = rg_i_fail_no_memory(RG_HERE);
-        give_up_rewrite_file(table);
+        rg_i_give_up_rewrite_file(&table);
         return leave(commit, __LINE__, rc);
     }
     if (rename(rewrite_path.get(), rg_i_set_data_path(&table)) != 0) {
         const kt_int32_t rc = rename_failure(commit, errno);
-        give_up_rewrite_file(table);
+        rg_i_give_up_rewrite_file(&table);
         return rc;
     }
     // The lock of the old file goes with its descriptor; apply took that of the new one.
