@@ -2,6 +2,9 @@
  *
  * kt_ku.h: the utility library: the error record, locale and string conversion, the data type class table, the shared
  * empty values and the comparison of resource handles.
+ *
+ * All functions may be called from several threads at once. None starts a thread or holds a lock when it returns. What
+ * they do on input out of the ordinary is told in docs/BAD-INPUT.md.
  */
 #ifndef KT_KU_H
 #define KT_KU_H
@@ -15,15 +18,17 @@ extern "C" {
 
 /* What ku_get_locale_info_1 and the ku_iconv_ functions return on a failure. */
 enum {
-    KU_E_INVALID_ARGUMENT = 1,
-    KU_E_UNKNOWN_CODESET  = 2,
-    KU_E_NO_COUNTERPART   = 3,
-    KU_E_TOO_LONG         = 4,
+    KU_E_INVALID_ARGUMENT = 1, /* a NULL pointer, an unknown flag, a category that doesn't exist */
+    KU_E_UNKNOWN_CODESET  = 2, /* the system can't convert to and from that code set */
+    KU_E_NO_COUNTERPART   = 3, /* not text of its code set, or a character that the other one hasn't */
+    KU_E_TOO_LONG         = 4, /* the result would have 4 GiB or more */
     KU_E_NO_MEMORY        = 5
 };
 
 /* ---- The error record ------------------------------------------------------------------------------------------ */
 
+/* What the last failure of the calling thread was. All pointers stay valid until the thread's next call into any of the
+ * libraries; copy what is to be kept longer. */
 typedef struct ku_error_record_t {
     kt_int32_t        code;      /* 0: no error stands */
     kt_int32_t        set;       /* message set in the catalog */
@@ -32,46 +37,122 @@ typedef struct ku_error_record_t {
     const kt_char_t * p_text;    /* the formatted message; "" if no error stands */
 } ku_error_record_t;
 
+/* Sets the calling thread's error record and formats its message.
+ *
+ *   code            the failure; 0 is the same as ku_set_no_error_1
+ *   reserved        0; not looked at
+ *   p_catalog       name of the message catalog, at most 127 bytes of which are kept; copied
+ *   set, message_index  where the message stands in the catalog
+ *   p_default_text  a printf format, as a rule with positional conversions ("%1$s"), used where no catalog has the
+ *                   message. NULL counts as ""
+ *   ...             the arguments of p_default_text
+ *
+ * The text comes from the catalog if the locale's messages category (LC_MESSAGES, as setlocale left it) isn't C or
+ * POSIX, catopen finds the catalog by NLSPATH, and the text there takes exactly the arguments that p_default_text
+ * takes, in any order. A catalog is looked for once for each locale in a process's life. A message longer than 12 KiB
+ * is cut at a character's border, and ends with a newline.
+ *
+ * Allocates nothing and cannot fail: if the system has not one page left for a thread's first message, the text is
+ * p_default_text with its conversions unresolved. Keeps errno. May be called under any lock and in a forked child. */
 void ku_set_error_1(kt_int32_t code, kt_int32_t reserved, const kt_char_t * p_catalog, kt_int32_t set,
                     kt_int32_t message_index, const kt_char_t * p_default_text, ...);
+
+/* Clears the calling thread's error record. Costs one store. */
 void ku_set_no_error_1(void);
+
+/* Fills *p_record with the calling thread's error record; code 0, zeros and empty strings if no error stands. A NULL
+ * p_record is passed over. Other threads' failures are never seen. */
 void ku_get_error_record_1(ku_error_record_t * p_record);
 
 /* ---- Locale and string conversion ------------------------------------------------------------------------------ */
 
+/* A conversion between one code set and the table encoding, in one direction. */
 typedef struct ku_iconv_t ku_iconv_t;
 
 /* Flags of ku_iconv_open_1. */
-enum { KU_ICONV_TO_TABLE = 0, KU_ICONV_FROM_TABLE = 1, KU_ICONV_UTF8_IS_NOT_MODIFIED = 8 };
+enum {
+    KU_ICONV_TO_TABLE             = 0,
+    KU_ICONV_FROM_TABLE           = 1,
+    KU_ICONV_UTF8_IS_NOT_MODIFIED = 8 /* a code set of UTF-8 passes bytes through; it always does */
+};
 
+/* Delivers what the process's locale is.
+ *
+ *   p_category_count, p_p_category_list  in: how many categories (LC_TIME...) are asked for, and the caller's array of
+ *                                        them, which stays the caller's. Out: a copy of the array, or NULL for a count
+ *                                        of 0
+ *   p_p_category_locales                 out: the name of the locale of each category, or NULL for a count of 0
+ *   p_item_count, p_p_item_list          the same for items of nl_langinfo (RADIXCHAR, DAY_1...)
+ *   p_p_item_langinfo                    out: the text of each item, or NULL for a count of 0
+ *   p_p_codeset                          out: the name of the locale's code set
+ *
+ * Returns 0; KU_E_INVALID_ARGUMENT for a NULL pointer, a count without an array, a category that doesn't exist;
+ * KU_E_NO_MEMORY. What was delivered goes back through ku_rel_locale_info_1; after a failure all outputs are NULL
+ * (untouched if one of the seven pointers was NULL). As with setlocale, no thread may change the process's locale
+ * meanwhile. */
 kt_int32_t ku_get_locale_info_1(kt_uint32_t * p_category_count, kt_int32_t ** p_p_category_list,
                                 kt_char_ptr_t ** p_p_category_locales, kt_uint32_t * p_item_count,
                                 kt_int32_t ** p_p_item_list, kt_char_ptr_t ** p_p_item_langinfo,
                                 kt_char_ptr_t * p_p_codeset);
+
+/* Releases what ku_get_locale_info_1 delivered; each argument may be NULL. */
 void ku_rel_locale_info_1(kt_int32_t * p_category_list, kt_char_ptr_t * p_category_locales, kt_int32_t * p_item_list,
                           kt_char_ptr_t * p_item_langinfo, kt_char_ptr_t p_codeset);
+
+/* Whether conversion handles should be opened with KU_ICONV_UTF8_IS_NOT_MODIFIED. Returns 1. */
 kt_int32_t ku_utf8_is_not_modified_1(void);
+
+/* Makes a conversion handle.
+ *
+ *   p_codeset   name of the code set, as iconv knows it. UTF-8 and the code set of the C/POSIX locale
+ *               (ANSI_X3.4-1968, US-ASCII, "C" and the like, in any case of letters) need no conversion: such a handle
+ *               passes bytes through unchanged, whatever they are
+ *   flags       KU_ICONV_TO_TABLE or KU_ICONV_FROM_TABLE, with or without KU_ICONV_UTF8_IS_NOT_MODIFIED
+ *   p_p_handle  receives the handle, which goes back through ku_iconv_close_1; untouched after a failure
+ *
+ * Returns 0, KU_E_INVALID_ARGUMENT, KU_E_UNKNOWN_CODESET (also for "" and for a name with a "/", since the suffixes of
+ * iconv lose characters) or KU_E_NO_MEMORY. */
 kt_int32_t ku_iconv_open_1(const kt_char_t * p_codeset, kt_int32_t flags, ku_iconv_t ** p_p_handle);
+
+/* Releases a handle that nobody is using any more. Returns 0, or KU_E_INVALID_ARGUMENT for NULL. */
 kt_int32_t ku_iconv_close_1(ku_iconv_t * p_handle);
+
+/* Converts a string.
+ *
+ *   p_handle       a handle; NULL passes bytes through. Several threads may use one handle at once, without waiting for
+ *                  each other
+ *   flags          0
+ *   p_input        the string
+ *   p_input_size   bytes to read from it; 0: up to its terminator. Not changed
+ *   p_p_output     receives the result, terminated, from malloc: the caller frees it
+ *   p_output_size  receives the bytes of the result, its terminator not counted
+ *
+ * Returns 0, KU_E_INVALID_ARGUMENT, KU_E_NO_COUNTERPART, KU_E_TOO_LONG or KU_E_NO_MEMORY. After a failure the outputs
+ * are untouched: nothing is ever converted in part. */
 kt_int32_t ku_iconv_str_1(ku_iconv_t * p_handle, kt_int32_t flags, const kt_char_t * p_input,
                           kt_uint32_t * p_input_size, kt_char_ptr_t * p_p_output, kt_uint32_t * p_output_size);
+
 /* Non-zero if the handle passes bytes through unchanged, so that a caller may copy instead of converting. NULL does. */
 kt_int32_t ku_iconv_is_identity_1(const ku_iconv_t * p_handle);
 
 /* ---- Data types and empty values ------------------------------------------------------------------------------- */
 
-/* Class bits of each data type. Bit value 4: values of the type are stored indirectly. */
+/* Class bits of each data type, by its number. KU_DTC_INDIRECT: values of the type don't lie in their slot, but behind
+ * it at an offset that the slot tells (docs/FILE-FORMAT.md). */
 enum { KU_DTC_INDIRECT = 4, KU_DTC_TYPES = 23 };
 extern const kt_uint32_t ku_dtc_table_1[KU_DTC_TYPES];
 
-/* The empty value of each kind. Shared, read-only, never released. */
+/* The empty value of each kind: what stands for a NULL pointer of that kind. Shared and read-only; never free them.
+ * The empty array also stands for an empty self-describing byte string. */
 extern const kt_char_ptr_t            ku_ptr_empty_char_1;
 extern const kt_binary_ptr_t          ku_ptr_empty_binary_1;
 extern const kt_resource_handle_ptr_t ku_ptr_invld_rsrc_hndl_1;
 extern const kt_sd_ptr_t              ku_ptr_empty_sd_1;
 extern const kt_array_ptr_t           ku_ptr_empty_array_1;
 
-/* Compares two kt_resource_handle_t at any alignment: 0 equal, else the sign of the first differing word. */
+/* Compares two kt_resource_handle_t, at any alignment, word by word as unsigned numbers from header to id4. Returns 0
+ * if they are equal, else -1 or 1: the order of the first words that differ. Has the form of a compare function of a
+ * hashed table. */
 kt_int32_t ku_rsrc_hndl_cmp_1(void * p_handle1, void * p_handle2);
 
 #pragma GCC visibility pop

@@ -11,6 +11,7 @@
 
 #include <cstdlib>
 #include <cstring>
+#include <utility>
 
 namespace
 {
@@ -26,14 +27,9 @@ const kt_char_t * text_of_item(kt_int32_t item)
 }
 
 // Copies the numbers asked for, and delivers their texts behind an array of pointers, in one block.
-kt_int32_t deliver(kt_uint32_t count, kt_int32_t ** p_p_list, kt_char_ptr_t ** p_p_texts,
+kt_int32_t deliver(kt_uint32_t count, const kt_int32_t * p_asked, kt_int32_t ** p_p_list, kt_char_ptr_t ** p_p_texts,
                    const kt_char_t * (*p_text_of)(kt_int32_t))
 {
-    if (p_p_list == nullptr || p_p_texts == nullptr)
-        return KU_E_INVALID_ARGUMENT;
-    const kt_int32_t * p_asked = *p_p_list;
-    *p_p_list                  = nullptr;
-    *p_p_texts                 = nullptr;
     if (count == 0)
         return 0;
     if (p_asked == nullptr)
@@ -81,24 +77,29 @@ extern "C" kt_int32_t ku_get_locale_info_1(kt_uint32_t * p_category_count, kt_in
                                            kt_int32_t ** p_p_item_list, kt_char_ptr_t ** p_p_item_langinfo,
                                            kt_char_ptr_t * p_p_codeset)
 {
-    if (p_category_count == nullptr || p_item_count == nullptr || p_p_codeset == nullptr)
+    if (p_category_count == nullptr || p_p_category_list == nullptr || p_p_category_locales == nullptr ||
+        p_item_count == nullptr || p_p_item_list == nullptr || p_p_item_langinfo == nullptr || p_p_codeset == nullptr)
         return KU_E_INVALID_ARGUMENT;
-    *p_p_codeset = nullptr;
+    const kt_int32_t * p_asked_categories = std::exchange(*p_p_category_list, nullptr);
+    const kt_int32_t * p_asked_items      = std::exchange(*p_p_item_list, nullptr);
+    *p_p_category_locales                 = nullptr;
+    *p_p_item_langinfo                    = nullptr;
+    *p_p_codeset                          = nullptr;
 
-    if (const kt_int32_t rc = deliver(*p_category_count, p_p_category_list, p_p_category_locales, locale_of_category);
-        rc != 0)
-        return rc;
-    kt_int32_t rc = deliver(*p_item_count, p_p_item_list, p_p_item_langinfo, text_of_item);
+    kt_int32_t rc =
+        deliver(*p_category_count, p_asked_categories, p_p_category_list, p_p_category_locales, locale_of_category);
+    if (rc == 0)
+        rc = deliver(*p_item_count, p_asked_items, p_p_item_list, p_p_item_langinfo, text_of_item);
     if (rc == 0) {
         *p_p_codeset = strdup(nl_langinfo(CODESET));
         if (*p_p_codeset != nullptr)
             return 0;
         rc = KU_E_NO_MEMORY;
-        release(p_p_item_list);
-        release(p_p_item_langinfo);
     }
     release(p_p_category_list);
     release(p_p_category_locales);
+    release(p_p_item_list);
+    release(p_p_item_langinfo);
     return rc;
 }
 

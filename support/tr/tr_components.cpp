@@ -18,7 +18,7 @@ std::atomic<kt_uint32_t> Tr_I_Wanted{0};
 namespace
 {
 
-constexpr kt_uint32_t most_components    = 32;
+constexpr kt_uint32_t most_components    = 128;
 constexpr size_t      component_name_max = 31;
 constexpr kt_uint32_t highest_level      = 255;
 
