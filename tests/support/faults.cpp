@@ -147,6 +147,7 @@ int     __real_pthread_mutex_unlock(pthread_mutex_t *);
 int     __real_pthread_cond_wait(pthread_cond_t *, pthread_mutex_t *);
 int     __real_pthread_cond_signal(pthread_cond_t *);
 int     __real_pthread_cond_broadcast(pthread_cond_t *);
+int     __real_pthread_atfork(void (*)(void), void (*)(void), void (*)(void));
 
 void * __wrap_malloc(size_t size)
 {
@@ -294,6 +295,11 @@ int __wrap_pthread_cond_signal(pthread_cond_t * p)
 int __wrap_pthread_cond_broadcast(pthread_cond_t * p)
 {
     return fails(call::cond_broadcast) ? errno : __real_pthread_cond_broadcast(p);
+}
+
+int __wrap_pthread_atfork(void (*prepare)(void), void (*parent)(void), void (*child)(void))
+{
+    return fails(call::atfork) ? errno : __real_pthread_atfork(prepare, parent, child);
 }
 
 } // extern "C"

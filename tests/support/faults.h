@@ -32,6 +32,7 @@ enum class call {
     cond_wait,
     cond_signal,
     cond_broadcast,
+    atfork,
     count_ // how many there are
 };
 
