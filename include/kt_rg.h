@@ -57,7 +57,9 @@ enum {
     RG_E_NO_COMMIT_RECORD       = 215
 };
 
-/* The default texts of the messages, by message index; index 0 is a filler. */
+/* The default texts of the messages, by message index (not by code): what the error record's text is made of where no
+ * catalog kt_rg.cat is found for the process's locale. Each but the filler at index 0 ends in a newline. Conversions
+ * carry positions, as in %1$s. Constant: never write to the array or to its texts. */
 enum { RG_TOTAL_MESSAGES = 32 };
 extern kt_char_ptr_t ku_mesgtbl_kt_rg_set[RG_TOTAL_MESSAGES];
 
@@ -130,10 +132,67 @@ typedef kt_int32_t rg_hash_keys_compare_function_t(void * p_key1, void * p_key2)
 
 /* ---- Trees and mount points ------------------------------------------------------------------------------------ */
 
+/* Opens a tree: the object that owns tables and mount points, and that every other call stands on. It starts without
+ * either. A process may hold any number of trees; they know nothing of each other, but meet in the files of directories
+ * that both mount. The first call of a process also registers the fork handler and the trace component, whatever its
+ * argument; a process where the fork handler can't be registered is aborted.
+ *
+ * tree_handle        receives the handle; untouched on failure. It goes back through rg_close_tree_1.
+ * number_of_retries  no effect.
+ * timeout            no effect.
+ *
+ * Returns 0; RG_E_INVALID_HANDLE if tree_handle is NULL; RG_E_NO_MEMORY; RG_E_LIBRARY_CALL if the strings of the
+ * process's locale can't be converted; RG_E_SYSTEM_CALL if a mutex fails. On failure nothing stays allocated.
+ *
+ * Any thread. Also in a forked child. The locale is looked at here once: call setlocale before.
+ */
 kt_int32_t rg_open_tree_1(rg_opaque_handle_t * tree_handle, kt_uint32_t number_of_retries, kt_uint64_t timeout);
+
+/* Closes a tree and destroys all that is in it: mount points, named tables and selection results, however often they
+ * are open. Their handles dangle from then on, and pending updates are dropped; the files of persistent tables stay as
+ * their last commit left them.
+ *
+ * tree_handle  a tree that no thread uses. Must not be closed twice.
+ *
+ * Returns 0; RG_E_INVALID_HANDLE if tree_handle is NULL; RG_E_SYSTEM_CALL if the tree's lock fails. If the mutex of the
+ * trees fails, the result of pthread_mutex_lock comes back as it is, with no error record. In both cases the tree stays
+ * whole, and may be closed again.
+ *
+ * Any thread. Also in a forked child.
+ */
 kt_int32_t rg_close_tree_1(rg_opaque_handle_t tree_handle);
+
+/* Mounts a directory of the file system: from then on every table whose path goes on behind the mount point is a file
+ * in it, named by the rest of the path with each "/" but the first made ",". Other paths name transient tables. The
+ * directory is made, with all above it (mode 0755), if it isn't there.
+ *
+ * tree_handle        the tree.
+ * p_registry_path    the mount point: 1 to 255 letters, digits, "_" and "/", without "//". Give it no trailing "/": such
+ *                    a mount point is accepted and never matches a path.
+ * p_filesystem_path  the directory. Both texts are copied.
+ * create             no effect: the directory is always made.
+ *
+ * Returns 0; RG_E_INTERNAL in a forked child, with no error record; RG_E_INVALID_HANDLE if tree_handle is NULL;
+ * RG_E_NULL_POINTER if p_filesystem_path is NULL; RG_E_INVALID_PATH; RG_E_MOUNT_POINT_EXISTS if the path is a mount
+ * point already, or lies below one; RG_E_TABLE_EXISTS if a transient table has that very name;
+ * RG_E_FILESYSTEM_FULL_DETAIL or RG_E_SYSTEM_CALL ("mkdir") if a directory can't be made, the ones above it staying;
+ * RG_E_NO_MEMORY; RG_E_SYSTEM_CALL if a lock fails. On failure nothing is mounted.
+ *
+ * Any thread. A mount point made above an existing one is accepted; a path below both belongs to either, so don't.
+ */
 kt_int32_t rg_mount_local_tree_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path,
                                  kt_char_ptr_t p_filesystem_path, kt_int32_t create);
+
+/* Takes a mount point out of a tree. The directory and its files stay, and open tables go on working on theirs.
+ *
+ * tree_handle      the tree.
+ * p_registry_path  the very text that was mounted. With a "/" added to it, it names nothing.
+ *
+ * Returns 0; RG_E_INVALID_HANDLE if tree_handle is NULL; RG_E_NO_SUCH_MOUNT_POINT if nothing is mounted by that text;
+ * RG_E_INVALID_PATH; RG_E_NO_MEMORY; RG_E_SYSTEM_CALL if the tree's lock fails. On failure nothing changes.
+ *
+ * Any thread. Also in a forked child.
+ */
 kt_int32_t rg_unmount_local_tree_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path);
 
 /* ---- Creating, opening and closing tables ---------------------------------------------------------------------- */

