@@ -16,10 +16,15 @@ kt_int32_t convert_text(ku_iconv_t * p_handle, const char * p_string, char ** p_
     kt_uint32_t   input_size  = 0; // up to the terminator
     kt_uint32_t   output_size = 0;
     kt_char_ptr_t p_text      = nullptr;
-    if (ku_iconv_str_1(p_handle, 0, p_string, &input_size, &p_text, &output_size) != 0 || p_text == nullptr)
+    if (const kt_int32_t rc = ku_iconv_str_1(p_handle, 0, p_string, &input_size, &p_text, &output_size); rc != 0)
+        return rc == KU_E_NO_MEMORY ? KT_PMSG_E_NO_MEMORY : KT_PMSG_E_CONVERSION;
+    // Strings end at their first zero byte. A code set whose characters hold one would lose the rest.
+    if (std::strlen(p_text) != output_size) {
+        std::free(p_text);
         return KT_PMSG_E_CONVERSION;
+    }
     *p_p_text = p_text;
-    *p_length = std::strlen(p_text) + 1;
+    *p_length = std::uint64_t{output_size} + 1;
     return 0;
 }
 

@@ -220,7 +220,7 @@ TEST(converting_damage, any_byte_changed_gives_a_readable_value_or_a_code_and_no
 TEST(converting_damage, a_local_value_taken_for_a_foreign_one_gives_a_code_and_stays)
 {
     stored s = stored_of(an_array(KT_CHAR_PTR_ARRAY, {a_string("one"), a_string("two")}));
-    EXPECT_EQ(kt_pmsg_convert_pmsg_value_1(s.slot.data(), KT_CHAR_PTR_ARRAY, s.area.data()), KT_PMSG_E_DAMAGED);
+    EXPECT_EQ(convert(s, KT_CHAR_PTR_ARRAY), KT_PMSG_E_DAMAGED);
     EXPECT_EQ(s, stored_of(an_array(KT_CHAR_PTR_ARRAY, {a_string("one"), a_string("two")})));
 }
 

@@ -32,8 +32,9 @@ void expect_stored(const model & m, const std::string & slot, const std::string 
     bytes expected = from_hex(slot + item);
     EXPECT_EQ(size, offset);
     EXPECT_EQ(8 + offset, expected.size());
-    if (std::endian::native == std::endian::big)
+    if (std::endian::native == std::endian::big) {
         ASSERT_EQ(kt_pmsg_convert_pmsg_value_1(expected.data(), m.type, expected.data() + 8), 0);
+    }
     EXPECT_EQ(to_hex(built), to_hex(expected));
 }
 

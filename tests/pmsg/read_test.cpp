@@ -418,7 +418,16 @@ TEST(reading_damage, items_nested_33_deep_give_4)
 {
     EXPECT_EQ(read_and_release(stored_of(nested(32)), KT_SD_PTR, no_bound), 0);
     EXPECT_EQ(read_and_release(stored_of(nested(33)), KT_SD_PTR, no_bound), KT_PMSG_E_DAMAGED);
-    EXPECT_EQ(read_and_release(stored_of(nested(5000)), KT_SD_PTR, no_bound), KT_PMSG_E_DAMAGED);
+}
+
+TEST(reading_damage, ten_thousand_levels_give_4_at_once)
+{
+    constexpr kt_uint32_t levels = 10000;
+    raw_item              raw({});
+    for (kt_uint32_t left = levels; left != 0; --left)
+        for (const kt_uint32_t word : {1u, 0u, kt_uint32_t{KT_SD_PTR}, 0u, 24u, (left - 1) * 24})
+            append(raw.bytes, word, machine::here);
+    EXPECT_EQ(raw.read_as(KT_SD_PTR), KT_PMSG_E_DAMAGED);
 }
 
 TEST(reading_damage, a_resource_handle_shorter_than_20_bytes_gives_4)

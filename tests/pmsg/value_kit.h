@@ -44,13 +44,13 @@ template <class Word> void put(octets & to, std::size_t at, Word word, machine o
 // ---- A value as a test writes it -----------------------------------------------------------------------------------
 
 struct model {
-    kt_data_type_t               type   = KT_UNKNOWN;
-    std::uint64_t                number = 0; // the bits of a scalar
-    std::string                  text;       // of a string; the bytes of a binary
-    std::array<std::uint32_t, 5> handle{};
-    std::vector<model>           elements; // of an array or structured data; the fields of an SBS
-    std::int8_t                  sn = 0;   // of a field of an SBS
-    std::string                  name;     // for messages of failed tests
+    kt_data_type_t               type     = KT_UNKNOWN;
+    std::uint64_t                number   = 0;  // the bits of a scalar
+    std::string                  text     = {}; // of a string; the bytes of a binary
+    std::array<std::uint32_t, 5> handle   = {};
+    std::vector<model>           elements = {}; // of an array or structured data; the fields of an SBS
+    std::int8_t                  sn       = 0;  // of a field of an SBS
+    std::string                  name     = {}; // for messages of failed tests
 };
 
 inline model a_number(kt_data_type_t type, std::uint64_t bits)
@@ -155,12 +155,10 @@ inline octets fields_of(const model & m, machine order)
 {
     octets fields(m.text.begin(), m.text.end());
     for (const model & field : m.elements) {
-        octets data(field.text.begin(), field.text.end());
-        if (!field.text.empty())
-            ; // bytes, whatever the type says
-        else if (is_32_bit(field.type))
+        octets data(field.text.begin(), field.text.end()); // any bytes, whatever the type says
+        if (field.text.empty() && is_32_bit(field.type))
             append(data, static_cast<std::uint32_t>(field.number), order);
-        else if (is_64_bit(field.type))
+        else if (field.text.empty() && is_64_bit(field.type))
             append(data, field.number, order);
         else if (field.type == KT_RSRC_HANDLE_PTR)
             for (const std::uint32_t word : field.handle)
