@@ -36,9 +36,14 @@ constexpr char module_version[] = "rg_i_delete_rows 1.0";
 {
     if (p_table->p_rows_hash_table == nullptr || p_index_entry->p_committed != nullptr)
         return 0;
-    const kt_char_t * p_key = p_index_entry->p_hash_table_element->p_key_value;
-    return rg_i_hash_table_own_key(p_table->p_rows_hash_table, p_index_entry->hash_index,
-                                   key_length(p_table->p_columns[0].type, p_key), &p_index_entry->p_hash_table_element);
+    rg_hash_table_element_t * p_element = p_index_entry->p_hash_table_element;
+    const kt_uint32_t         length    = key_length(p_table->p_columns[0].type, p_element->p_key_value);
+    if (const kt_int32_t rc =
+            rg_i_hash_table_own_key(p_table->p_rows_hash_table, p_index_entry->hash_index, length, &p_element);
+        rc != 0)
+        return rc;
+    p_index_entry->p_hash_table_element = p_element;
+    return 0;
 }
 
 } // namespace

@@ -276,7 +276,7 @@ TEST_P(adding_rows, the_record_is_the_slots_and_then_the_indirect_data_in_column
                                                     "04 00 00 00 05 00 00 00" // anchor of c
                                             "64 65 66 00"             // "def"
                                             "6c 61 73 74 00");        // "last"
-    EXPECT_EQ(rg_i_record_head(p_record)->type, static_cast<kt_uint32_t>(RG_RECORD_TYPE_ROW));
+    EXPECT_EQ(+rg_i_record_head(p_record)->type, static_cast<kt_uint32_t>(RG_RECORD_TYPE_ROW));
     ASSERT_EQ(rg_i_record_data_length(p_record), expected.size());
     EXPECT_EQ(to_hex(bytes(p_record, p_record + expected.size())), to_hex(expected));
 }

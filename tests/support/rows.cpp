@@ -21,8 +21,9 @@ void look_at_pool(const rg_i_record_buffer_pool_t & pool, table_picture & pictur
         const char * p_end    = reinterpret_cast<const char *>(p_block) + p_block->total_bytes;
         heads += RG_I_RECORD_BUFFER_HEAD_LENGTH;
         while (p_record < p_end) {
-            const rg_i_record_metadata_t & head = *reinterpret_cast<const rg_i_record_metadata_t *>(p_record);
-            ASSERT_GE(head.record_length, RG_I_RECORD_HEAD_LENGTH);
+            rg_i_record_metadata_t head; // a copy: heads lie at any alignment
+            std::memcpy(&head, p_record, sizeof head);
+            ASSERT_GE(+head.record_length, RG_I_RECORD_HEAD_LENGTH);
             if (head.type == RG_RECORD_TYPE_FREE) {
                 free_records.push_back(p_record);
                 heads += RG_I_RECORD_HEAD_LENGTH;
@@ -76,8 +77,8 @@ void look_at_list(const rg_i_table_t & table, const rg_i_change_entry_t * p_entr
                   std::vector<kt_uint32_t> & list)
 {
     for (; p_entry != nullptr; p_entry = p_entry->p_next) {
-        ASSERT_EQ(p_entry->deletion, deletion);
-        ASSERT_EQ(p_entry->p_index_entry->p_pending_change, p_entry);
+        ASSERT_EQ(+p_entry->deletion, deletion);
+        ASSERT_TRUE(p_entry->p_index_entry->p_pending_change == p_entry);
         list.push_back(static_cast<kt_uint32_t>(p_entry->p_index_entry - table.p_rows_fixed_index));
     }
 }
@@ -91,7 +92,7 @@ void look_at_hash_table(const rg_i_table_t & table, table_picture & picture)
              p                                 = p->p_next) {
             picture.hashed.push_back(bucket);
             picture.hashed.push_back(p->row_index);
-            ASSERT_EQ(table.p_rows_fixed_index[p->row_index].p_hash_table_element, p);
+            ASSERT_TRUE(table.p_rows_fixed_index[p->row_index].p_hash_table_element == p);
             ASSERT_EQ(table.p_rows_fixed_index[p->row_index].hash_index, bucket);
         }
     ASSERT_EQ(picture.hashed.size() / 2, table.total_applied_rows);
