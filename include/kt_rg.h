@@ -167,8 +167,8 @@ kt_int32_t rg_close_tree_1(rg_opaque_handle_t tree_handle);
  * directory is made, with all above it (mode 0755), if it isn't there.
  *
  * tree_handle        the tree.
- * p_registry_path    the mount point: 1 to 255 letters, digits, "_" and "/", without "//". Give it no trailing "/": such
- *                    a mount point is accepted and never matches a path.
+ * p_registry_path    the mount point: 1 to 255 letters, digits, "_" and "/", without "//". Give it no "/" at the end:
+ *                    such a mount point is accepted and never matches a path.
  * p_filesystem_path  the directory. Both texts are copied.
  * create             no effect: the directory is always made.
  *
