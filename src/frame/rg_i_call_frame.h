@@ -112,6 +112,21 @@ inline kt_int32_t rg_i_finish_call(entry_id id, kt_int32_t rc)
     return rg_i_commit(&table);
 }
 
+// What every updating call has around it: refused in a forked child, traced, and one at a time in a process. The worker
+// tests its handle and takes its own locks.
+template <entry_id id, class Worker> [[nodiscard]] kt_int32_t rg_i_exclusive_call(Worker && worker)
+{
+    if (In_Child_Process != 0)
+        return RG_E_INTERNAL; // no record and no event: the parent's state is not ours to touch
+
+    rg_i_trace_entry(id);
+    const kt_int32_t rc = [&]() -> kt_int32_t {
+        const mutex_guard fork_lock(ForkMutex);
+        return worker();
+    }();
+    return rg_i_finish_call(id, rc);
+}
+
 enum class needs_write_mode { no, yes };
 enum class completes_implicitly { no, yes };
 
@@ -120,30 +135,23 @@ template <entry_id id, needs_write_mode write_mode, completes_implicitly complet
 [[nodiscard]] kt_int32_t rg_i_updating_frame(const rg_i_site_t & site, rg_opaque_handle_t table_handle,
                                              Worker && worker)
 {
-    if (In_Child_Process != 0)
-        return RG_E_INTERNAL; // no record and no event: the parent's state is not ours to touch
-
-    rg_i_trace_entry(id);
-    const kt_int32_t rc = [&]() -> kt_int32_t {
-        mutex_guard fork_lock(ForkMutex);
-        if (const kt_int32_t handle_rc = rg_i_check_handle(site, table_handle); handle_rc != 0)
-            return handle_rc;
-
-        rg_i_table_t & table = *static_cast<rg_i_table_t *>(table_handle);
-        write_guard    table_lock(table.lock);
+    return rg_i_exclusive_call<id>([&]() -> kt_int32_t {
+        if (const kt_int32_t rc = rg_i_check_handle(site, table_handle); rc != 0)
+            return rc;
+        rg_i_table_t &    table = *static_cast<rg_i_table_t *>(table_handle);
+        const write_guard table_lock(table.lock);
         if (table_lock.code() != 0)
             return table_lock.code();
         if constexpr (write_mode == needs_write_mode::yes)
             if ((table.mode & RG_MODE_WRITE) == 0)
                 return rg_i_fail(site, RG_E_ACCESS);
 
-        const kt_int32_t worker_rc = worker(table);
+        const kt_int32_t rc = worker(table);
         if constexpr (completes == completes_implicitly::yes)
-            if (worker_rc == 0 && table.implicitly_controlled != 0)
+            if (rc == 0 && table.implicitly_controlled != 0)
                 return rg_i_complete_implicitly(table);
-        return worker_rc;
-    }();
-    return rg_i_finish_call(id, rc);
+        return rc;
+    });
 }
 
 // A row update: needs a table open for writing, and completes by itself on an implicitly controlled one.
@@ -166,17 +174,11 @@ template <entry_id id, class Worker>
 [[nodiscard]] kt_int32_t rg_i_tree_updating_call(const rg_i_site_t & site, rg_opaque_handle_t tree_handle,
                                                  Worker && worker)
 {
-    if (In_Child_Process != 0)
-        return RG_E_INTERNAL;
-
-    rg_i_trace_entry(id);
-    const kt_int32_t rc = [&]() -> kt_int32_t {
-        mutex_guard fork_lock(ForkMutex);
-        if (const kt_int32_t handle_rc = rg_i_check_handle(site, tree_handle); handle_rc != 0)
-            return handle_rc;
+    return rg_i_exclusive_call<id>([&]() -> kt_int32_t {
+        if (const kt_int32_t rc = rg_i_check_handle(site, tree_handle); rc != 0)
+            return rc;
         return worker(*static_cast<rg_i_tree_t *>(tree_handle));
-    }();
-    return rg_i_finish_call(id, rc);
+    });
 }
 
 // The frame of a reading call. The worker gets the table, read-locked. A forked child may read what it inherited.
@@ -187,8 +189,8 @@ template <entry_id id, class Worker>
     const kt_int32_t rc = [&]() -> kt_int32_t {
         if (const kt_int32_t handle_rc = rg_i_check_handle(site, table_handle); handle_rc != 0)
             return handle_rc;
-        rg_i_table_t & table = *static_cast<rg_i_table_t *>(table_handle);
-        read_guard     table_lock(table.lock);
+        rg_i_table_t &   table = *static_cast<rg_i_table_t *>(table_handle);
+        const read_guard table_lock(table.lock);
         if (table_lock.code() != 0)
             return table_lock.code();
         return worker(table);

@@ -18,17 +18,11 @@ constexpr kt_uint32_t the_binary = 0;
 // The frame of a call without a binary: refused behind the handle, ahead of the table's lock and mode.
 [[nodiscard]] kt_int32_t refuse_without_binary(const rg_i_site_t & site, rg_opaque_handle_t table_handle)
 {
-    if (In_Child_Process != 0)
-        return RG_E_INTERNAL;
-
-    rg_i_trace_entry(entry_id::set_application_metadata);
-    const kt_int32_t rc = [&]() -> kt_int32_t {
-        const mutex_guard fork_lock(ForkMutex);
-        if (const kt_int32_t handle_rc = rg_i_check_handle(site, table_handle); handle_rc != 0)
-            return handle_rc;
+    return rg_i_exclusive_call<entry_id::set_application_metadata>([&]() -> kt_int32_t {
+        if (const kt_int32_t rc = rg_i_check_handle(site, table_handle); rc != 0)
+            return rc;
         return rg_i_fail(site, RG_E_NULL_POINTER);
-    }();
-    return rg_i_finish_call(entry_id::set_application_metadata, rc);
+    });
 }
 
 } // namespace

@@ -72,20 +72,6 @@ struct create_request_t {
     return 0;
 }
 
-// The frame of a creation: that of an updating call up to ForkMutex. The worker tests the handle and locks the tree.
-template <entry_id id, class Worker> [[nodiscard]] kt_int32_t creating_call(Worker && worker)
-{
-    if (In_Child_Process != 0)
-        return RG_E_INTERNAL; // no record and no event
-
-    rg_i_trace_entry(id);
-    const kt_int32_t rc = [&]() -> kt_int32_t {
-        const mutex_guard fork_lock(ForkMutex);
-        return worker();
-    }();
-    return rg_i_finish_call(id, rc);
-}
-
 } // namespace
 
 kt_int32_t rg_x_create_table(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path, rg_column_t * p_columns,
@@ -119,7 +105,7 @@ extern "C" kt_int32_t rg_create_table_1(rg_opaque_handle_t tree_handle, kt_char_
                                         rg_column_t * p_columns, kt_uint32_t array_count, kt_int32_t mode,
                                         rg_opaque_handle_t * p_result_table_handle)
 {
-    return creating_call<entry_id::create_table>([&] {
+    return rg_i_exclusive_call<entry_id::create_table>([&] {
         return rg_x_create_table(tree_handle, p_registry_path, p_columns, array_count, mode, nullptr, nullptr,
                                  p_result_table_handle);
     });
@@ -132,7 +118,7 @@ extern "C" kt_int32_t rg_create_hashed_key_table_1(rg_opaque_handle_t tree_handl
                                                    rg_opaque_handle_t *              p_result_table_handle)
 {
     const rg_i_site_t site = RG_HERE;
-    return creating_call<entry_id::create_hashed_key_table>([&]() -> kt_int32_t {
+    return rg_i_exclusive_call<entry_id::create_hashed_key_table>([&]() -> kt_int32_t {
         if (total_hash_buckets == 0 || p_hash_function == nullptr || p_compare_function == nullptr)
             return rg_i_fail(site, RG_E_NULL_POINTER);
         rg_hash_table_t * p_hash_table = nullptr;
