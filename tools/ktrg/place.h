@@ -1,0 +1,40 @@
+// SPDX-License-Identifier: MIT
+// place: where a table is: what the user names, as a directory, a file and a registry path.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace ktrg
+{
+
+// The tool mounts the table's directory here, in a tree of its own.
+inline constexpr const char * mount_point = "/t";
+
+struct place {
+    std::string                  name;          // as the user wrote it, without @COUNTER: for messages
+    std::string                  directory;     // "." if the name has no "/" and KTRG_ROOT isn't set
+    std::string                  file;          // path of the table's file
+    std::string                  registry_path; // below mount_point, with "/" for each "," of the file's name
+    std::optional<std::uint64_t> counter;       // of TABLE@COUNTER
+};
+
+// Throws a usage failure for what no registry path can name.
+[[nodiscard]] place find_place(const std::string & table);
+
+// The directory that names without "/" are looked for in.
+[[nodiscard]] std::string root_directory();
+
+// Whether a file of this name can be a table.
+[[nodiscard]] bool is_table_file_name(const std::string & file_name);
+
+// The names of the files in the directory that begin like tables, in order; as `name`s of places in that directory.
+[[nodiscard]] std::vector<std::string> tables_in(const std::string & directory);
+
+// The failure for a table that isn't there, with a near name and the way out.
+class failure;
+[[nodiscard]] failure no_such_table(const place & where);
+
+} // namespace ktrg

@@ -1,0 +1,93 @@
+// SPDX-License-Identifier: MIT
+// registry: the library's trees and tables with an owner, and failures instead of codes.
+//
+// A tree of ours mounts one directory at place.h's mount point. Reading opens read-only, takes no lock and never waits.
+// Writing asks first whether another process holds the table, since the library's own open would wait for it without an
+// end; and it makes sure that the file it got is still the table's, for a writer may have put a new file in its place
+// while we waited.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "columns.h"
+#include "kt_rg.h"
+#include "place.h"
+
+namespace ktrg
+{
+
+// The values of one row, in the order of the columns asked for. What is stored indirectly belongs to the record.
+class row_values
+{
+  public:
+    explicit row_values(const std::vector<column> & columns);
+    ~row_values() { release(); }
+    row_values(const row_values &)             = delete;
+    row_values & operator=(const row_values &) = delete;
+
+    [[nodiscard]] const std::vector<column> & columns() const { return columns_; }
+    [[nodiscard]] const kt_value_t &          operator[](std::size_t i) const { return values_[i]; }
+    void                                      release();
+
+  private:
+    friend class table;
+    std::vector<column>        columns_;
+    std::vector<kt_char_ptr_t> names_;
+    std::vector<kt_value_t>    values_;
+    std::vector<kt_value_t *>  addresses_;
+};
+
+class table
+{
+  public:
+    // For reading. `hashed` builds an index of the keys at the open: for more lookups than a few.
+    static table open_for_reading(const place & where, bool hashed = false);
+    // For writing, in explicit control: apply and commit are the caller's. Waits up to so many seconds for a process
+    // that holds the table.
+    static table open_for_writing(const place & where, double wait_seconds);
+    // A new table with its file, or one in memory only.
+    static table create(const place & where, const std::vector<column> & columns, std::uint64_t expected_rows);
+    static table create_in_memory(const place & where, const std::vector<column> & columns,
+                                  std::uint64_t expected_rows);
+
+    table(table && other) noexcept;
+    table & operator=(table &&) = delete;
+    ~table();
+
+    [[nodiscard]] const place &               where() const { return where_; }
+    [[nodiscard]] const std::vector<column> & columns() const { return columns_; }
+    [[nodiscard]] rg_opaque_handle_t          handle() const { return handle_; }
+
+    // Reads the row at a position among the committed rows; false behind the last.
+    bool read(std::uint64_t position, row_values & values) const;
+    // Reads the row with the key; false if there is none.
+    bool read_by_key(kt_value_t key, row_values & values) const;
+    // The number of rows.
+    [[nodiscard]] std::uint64_t count() const;
+
+    // Returns the code of the registry, since the caller knows which of its rows it was.
+    [[nodiscard]] kt_int32_t add(const std::vector<kt_char_ptr_t> & names,
+                                 const std::vector<kt_value_t *> &  values) const;
+
+    // Makes all that is pending permanent, in one transaction.
+    void commit();
+    // Gives the table back. What isn't committed is gone.
+    void close();
+    // Closes a table that create() made, and removes its file.
+    void remove();
+
+  private:
+    explicit table(place where) : where_(std::move(where)) {}
+    void open_tree();
+    void mount();
+    void make(const std::string & registry_path, const std::vector<column> & columns, std::uint64_t expected_rows);
+
+    place               where_;
+    std::vector<column> columns_;
+    rg_opaque_handle_t  tree_   = nullptr;
+    rg_opaque_handle_t  handle_ = nullptr;
+};
+
+} // namespace ktrg

@@ -1,0 +1,74 @@
+// SPDX-License-Identifier: MIT
+// verbs: what ktrg does, one function a verb. The command line (command_line.cpp) fills the options in; the verbs know
+// nothing of how they were written.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "failure.h"
+#include "output.h"
+
+namespace ktrg
+{
+
+// What every verb has.
+struct common_options {
+    std::optional<output_form> form; // none: the verb's own
+    output_style               style;
+    error_style                errors       = error_style::text;
+    bool                       quiet        = false;
+    bool                       verbose      = false;
+    bool                       dry_run      = false;
+    double                     wait_seconds = 0;
+
+    // The style with the form that the user asked for, or else the verb's own.
+    [[nodiscard]] output_style style_or(output_form own) const
+    {
+        output_style result = style;
+        result.form         = form.value_or(own);
+        return result;
+    }
+};
+
+struct ls_options {
+    std::string directory; // empty: where names without "/" are looked for
+};
+
+struct table_options {
+    std::string table;
+};
+
+struct get_options {
+    std::string              table;
+    std::vector<std::string> keys;
+    std::vector<std::string> columns;
+};
+
+struct select_options {
+    std::string                table;
+    std::vector<std::string>   columns;
+    std::vector<std::string>   sort; // column names, with "-" in front for descending order
+    std::optional<std::size_t> limit;
+    bool                       count = false;
+};
+
+struct import_options {
+    std::string              table;
+    std::string              file;
+    std::string              format; // empty: by the file's name, csv if that says nothing
+    bool                     create = false;
+    std::string              key;
+    std::vector<std::string> types;   // name:type[:flags][=default]
+    std::vector<std::string> renamed; // a=b: the file's column a is the table's b
+};
+
+[[nodiscard]] exit_code run_ls(const common_options & common, const ls_options & options);
+[[nodiscard]] exit_code run_schema(const common_options & common, const table_options & options);
+[[nodiscard]] exit_code run_stat(const common_options & common, const table_options & options);
+[[nodiscard]] exit_code run_get(const common_options & common, const get_options & options);
+[[nodiscard]] exit_code run_select(const common_options & common, const select_options & options);
+[[nodiscard]] exit_code run_import(const common_options & common, const import_options & options);
+
+} // namespace ktrg
