@@ -231,6 +231,27 @@ TEST(mounting, a_lock_that_fails_gives_10)
     pthread_mutex_unlock(&ForkMutex);
 }
 
+TEST(mounting, at_the_very_name_of_a_transient_table_is_refused)
+{
+    const temp_dir  dir;
+    const open_tree tree;
+    ASSERT_NE(create_table(tree, "/m", {column("K", KT_UINT32, RG_PRIMARY_KEY)}, RG_MODE_WRITE), nullptr);
+    expect_refused(mount(tree, "/m", dir.file("d")), 201, 18);
+    EXPECT_FALSE(file_exists(dir.file("d")));
+    EXPECT_EQ(mount(tree, "/n", dir.path()), 0);
+}
+
+TEST(mounting, above_a_transient_table_leaves_its_handle_working)
+{
+    const temp_dir           dir;
+    const open_tree          tree;
+    const rg_opaque_handle_t table =
+        create_table(tree, "/m/t", {column("K", KT_UINT32, RG_PRIMARY_KEY)}, RG_MODE_WRITE);
+    EXPECT_EQ(mount(tree, "/m", dir.path()), 0);
+    EXPECT_EQ(add_row(table, {{"K", uint32(1)}}), 0);
+    EXPECT_EQ(rg_close_table_1(table), 0);
+}
+
 // ---- Unmounting ----
 
 TEST(unmounting, makes_the_paths_below_transient_again)
@@ -292,6 +313,26 @@ TEST(unmounting, a_bad_path_is_refused)
 TEST(unmounting, a_null_tree_is_refused)
 {
     expect_refused(rg_unmount_local_tree_1(nullptr, text("/m")), 100, 7);
+}
+
+TEST(unmounting, leaves_open_tables_working_and_a_later_mount_finds_them_again)
+{
+    const temp_dir  dir;
+    const open_tree tree;
+    EXPECT_EQ(mount(tree, "/m", dir.path()), 0);
+    const rg_opaque_handle_t table =
+        create_table(tree, "/m/t", {column("K", KT_UINT32, RG_PRIMARY_KEY)}, RG_MODE_WRITE);
+    EXPECT_EQ(unmount(tree, "/m"), 0);
+    EXPECT_EQ(add_row(table, {{"K", uint32(1)}}), 0);
+    EXPECT_EQ(rg_close_table_1(table), 0);
+
+    kt_int32_t rc = 0;
+    EXPECT_EQ(open_table(tree, "/m/t", RG_MODE_READ, &rc), nullptr);
+    EXPECT_EQ(rc, 200);
+    EXPECT_EQ(mount(tree, "/m", dir.path()), 0);
+    const rg_opaque_handle_t again = open_table(tree, "/m/t", RG_MODE_READ);
+    kt_value_t               value;
+    EXPECT_EQ(rg_get_field_by_key_1(again, uint32(1), text("K"), &value), 0);
 }
 
 TEST(unmounting, each_of_many_mount_points_by_its_own_name)

@@ -5,6 +5,8 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
+#include <iterator>
 #include <string>
 #include <thread>
 #include <vector>
@@ -28,6 +30,12 @@ rg_i_tree_t & inside(rg_opaque_handle_t tree)
 bool is_known(rg_opaque_handle_t tree)
 {
     return tfind(tree, &P_Registry_Trees, rg_i_pointer_compare) != nullptr;
+}
+
+size_t open_descriptors()
+{
+    const std::filesystem::directory_iterator all("/proc/self/fd");
+    return static_cast<size_t>(std::distance(begin(all), end(all)));
 }
 
 bool is_free(pthread_mutex_t & mutex)
@@ -239,6 +247,39 @@ TEST(closing_a_tree, a_lock_of_the_tree_that_fails_gives_10_and_the_tree_can_be_
         EXPECT_EQ(error_message_index(), 1);
     }
     EXPECT_EQ(rg_close_tree_1(tree), 0);
+}
+
+TEST(closing_a_tree, with_open_tables_frees_them_all_and_drops_what_is_pending)
+{
+    const temp_dir dir;
+    const auto     columns = [] { return std::vector<rg_column_t>{column("K", KT_UINT32, RG_PRIMARY_KEY)}; };
+    const auto     key     = [](kt_uint32_t k) { return named_value{"K", uint32(k)}; };
+    open_tree      tree;
+    tree.mount("/m", dir.path());
+    const kt_int32_t         explicit_writing = RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL;
+    const rg_opaque_handle_t kept             = create_table(tree, "/m/t", columns(), explicit_writing);
+    const rg_opaque_handle_t applied          = create_hashed_table(tree, "/m/applied", columns(), explicit_writing);
+    const rg_opaque_handle_t transient        = create_hashed_table(tree, "/t", columns(), explicit_writing);
+    EXPECT_EQ(open_table(tree, "/m/t", RG_MODE_READ), kept); // twice open
+    EXPECT_EQ(add_row(kept, {key(1)}), 0);
+    EXPECT_EQ(rg_apply_1(kept, 0), 0);
+    EXPECT_EQ(rg_commit_1(kept), 0);
+    EXPECT_EQ(add_row(kept, {key(2)}), 0);
+    EXPECT_EQ(add_row(transient, {key(3)}), 0);
+    EXPECT_EQ(add_row(applied, {key(4)}), 0);
+    EXPECT_EQ(rg_apply_1(applied, 0), 0);
+    const size_t descriptors = open_descriptors();
+    tree.close();
+    EXPECT_EQ(open_descriptors(), descriptors - 2);
+
+    open_tree second;
+    second.mount("/m", dir.path());
+    kt_value_t               value;
+    const rg_opaque_handle_t again = open_table(second, "/m/t", RG_MODE_READ);
+    EXPECT_EQ(rg_get_field_by_key_1(again, uint32(1), text("K"), &value), 0);
+    EXPECT_EQ(rg_get_field_by_key_1(again, uint32(2), text("K"), &value), 202);
+    const rg_opaque_handle_t never_committed = open_table(second, "/m/applied", RG_MODE_READ);
+    EXPECT_EQ(rg_get_field_by_key_1(never_committed, uint32(4), text("K"), &value), 202);
 }
 
 // ---- The conversion handles ----

@@ -1,0 +1,93 @@
+// SPDX-License-Identifier: MIT
+// exported_calls: all functions of the interface that take a handle, with their trace ids.
+#pragma once
+
+#include <functional>
+#include <vector>
+
+#include "support/registry.h"
+
+namespace kt_test
+{
+
+struct exported_call {
+    const char *                                  name;
+    kt_uint32_t                                   entry_id;
+    bool                                          is_update; // refused in a forked child
+    std::function<kt_int32_t(rg_opaque_handle_t)> call;
+};
+
+// Each exported call, given the handle and otherwise good arguments.
+inline const std::vector<exported_call> & all_calls()
+{
+    static kt_char_ptr_t  name   = text("K");
+    static kt_char_ptr_t  path   = text("/t");
+    static kt_char_ptr_t  dir    = text("/tmp");
+    static kt_value_t     value  = uint32(1);
+    static kt_value_t *   values = &value;
+    static rg_column_t    key    = column("K", KT_UINT32, RG_PRIMARY_KEY);
+    static rg_row_state_t state;
+    static kt_uint32_t    index;
+    static kt_binary_t    binary{1, {0}};
+    static kt_binary_t *  p_binary;
+    using handle_t = rg_opaque_handle_t;
+    static handle_t result;
+
+    static const std::vector<exported_call> calls = {
+        {"rg_abort_1", 1, true, [](handle_t h) { return rg_abort_1(h); }},
+        {"rg_add_row_1", 5, true, [](handle_t h) { return rg_add_row_1(h, &name, &values, 1); }},
+        {"rg_apply_1", 7, true, [](handle_t h) { return rg_apply_1(h, 0); }},
+        {"rg_close_table_1", 13, false, [](handle_t h) { return rg_close_table_1(h); }},
+        {"rg_close_tree_1", 15, false, [](handle_t h) { return rg_close_tree_1(h); }},
+        {"rg_commit_1", 17, true, [](handle_t h) { return rg_commit_1(h); }},
+        {"rg_create_table_1", 23, true, [](handle_t h) { return rg_create_table_1(h, path, &key, 1, 2, &result); }},
+        {"rg_create_hashed_key_table_1", 25, true,
+         [](handle_t h) {
+             return rg_create_hashed_key_table_1(h, path, &key, 1, 2, 8, hash_uint32, compare_uint32, &result);
+         }},
+        {"rg_delete_row_by_index_1", 29, true, [](handle_t h) { return rg_delete_row_by_index_1(h, 0); }},
+        {"rg_get_application_metadata_1", 39, false,
+         [](handle_t h) { return rg_get_application_metadata_1(h, &p_binary); }},
+        {"rg_get_field_by_fixed_index_and_visibility_1", 43, false,
+         [](handle_t h) { return rg_get_field_by_fixed_index_and_visibility_1(h, 0, name, &value, 0, &state); }},
+        {"rg_get_field_by_index_1", 45, false, [](handle_t h) { return rg_get_field_by_index_1(h, 0, name, &value); }},
+        {"rg_get_field_by_index_and_visibility_1", 47, false,
+         [](handle_t h) { return rg_get_field_by_index_and_visibility_1(h, 0, name, &value, 0, &state); }},
+        {"rg_get_field_by_key_1", 49, false, [](handle_t h) { return rg_get_field_by_key_1(h, value, name, &value); }},
+        {"rg_get_field_by_key_and_visibility_1", 51, false,
+         [](handle_t h) { return rg_get_field_by_key_and_visibility_1(h, value, name, &value, 0, &state); }},
+        {"rg_get_fields_by_fixed_index_and_visibility_1", 53, false,
+         [](handle_t h) { return rg_get_fields_by_fixed_index_and_visibility_1(h, 0, &name, &values, 1, 0, &state); }},
+        {"rg_get_fields_by_index_1", 55, false,
+         [](handle_t h) { return rg_get_fields_by_index_1(h, 0, &name, &values, 1); }},
+        {"rg_get_fields_by_index_and_visibility_1", 57, false,
+         [](handle_t h) { return rg_get_fields_by_index_and_visibility_1(h, 0, &name, &values, 1, 0, &state); }},
+        {"rg_get_fields_by_key_1", 59, false,
+         [](handle_t h) { return rg_get_fields_by_key_1(h, value, &name, &values, 1); }},
+        {"rg_get_fields_by_key_and_visibility_1", 61, false,
+         [](handle_t h) { return rg_get_fields_by_key_and_visibility_1(h, value, &name, &values, 1, 0, &state); }},
+        {"rg_mount_local_tree_1", 71, true, [](handle_t h) { return rg_mount_local_tree_1(h, path, dir, 1); }},
+        {"rg_open_table_1", 77, false, [](handle_t h) { return rg_open_table_1(h, path, 2, &result); }},
+        {"rg_open_hashed_key_table_1", 79, false,
+         [](handle_t h) { return rg_open_hashed_key_table_1(h, path, 2, 8, hash_uint32, compare_uint32, &result); }},
+        {"rg_open_tree_1", 81, false, [](handle_t h) { return rg_open_tree_1(static_cast<handle_t *>(h), 0, 0); }},
+        {"rg_set_application_metadata_1", 91, true,
+         [](handle_t h) { return rg_set_application_metadata_1(h, &binary); }},
+        {"rg_set_field_by_fixed_index_1", 93, true,
+         [](handle_t h) { return rg_set_field_by_fixed_index_1(h, 0, name, &value); }},
+        {"rg_set_field_by_index_1", 95, true, [](handle_t h) { return rg_set_field_by_index_1(h, 0, name, &value); }},
+        {"rg_set_field_by_key_1", 97, true, [](handle_t h) { return rg_set_field_by_key_1(h, value, name, &value); }},
+        {"rg_set_fields_by_fixed_index_1", 99, true,
+         [](handle_t h) { return rg_set_fields_by_fixed_index_1(h, 0, &name, &values, 1); }},
+        {"rg_set_fields_by_index_1", 101, true,
+         [](handle_t h) { return rg_set_fields_by_index_1(h, 0, &name, &values, 1); }},
+        {"rg_set_fields_by_key_1", 103, true,
+         [](handle_t h) { return rg_set_fields_by_key_1(h, value, &name, &values, 1); }},
+        {"rg_unmount_local_tree_1", 105, false, [](handle_t h) { return rg_unmount_local_tree_1(h, path); }},
+        {"rg_get_fixed_row_index_for_key_1", 107, false,
+         [](handle_t h) { return rg_get_fixed_row_index_for_key_1(h, value, &index); }},
+    };
+    return calls;
+}
+
+} // namespace kt_test
