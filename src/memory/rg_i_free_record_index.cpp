@@ -134,37 +134,59 @@ void raise_bounds(block_t * p_block, kt_uint32_t segment, kt_uint32_t length)
     }
 }
 
-// The first segment from `segment` on whose bound is `length` or more. Bounds of whole groups that turn out to be too
-// high are corrected on the way.
+// The walks below go through groups of 16 bounds. A group that a walk came down into is gone through from one end to
+// the other, so when nothing was found in it the bound over it was too high, and is corrected.
+struct walk_t {
+    const levels_t & levels;
+    kt_uint32_t      level;
+    kt_uint32_t      group;       // first entry of the group
+    kt_uint32_t      whole_below; // groups of lower levels are gone through whole
+
+    kt_uint32_t * bounds() const { return levels.p_bounds[level]; }
+    kt_uint32_t   group_end() const { return std::min(group + fan_out, levels.count[level]); }
+
+    void go_down(kt_uint32_t entry)
+    {
+        whole_below = std::max(whole_below, level);
+        group       = entry * fan_out;
+        --level;
+    }
+    // The entry over the group; false if there is no level above.
+    bool go_up(kt_uint32_t * p_entry)
+    {
+        if (level == levels.top)
+            return false;
+        *p_entry = group / fan_out;
+        if (level < whole_below)
+            levels.p_bounds[level + 1][*p_entry] = *std::max_element(bounds() + group, bounds() + group_end());
+        ++level;
+        group = *p_entry - *p_entry % fan_out;
+        return true;
+    }
+};
+
+// The first segment from `segment` on whose bound is `length` or more.
 kt_uint32_t next_segment(const levels_t & levels, kt_uint32_t segment, kt_uint32_t length)
 {
     if (segment >= levels.count[0])
         return nothing;
-    kt_uint32_t level = segment == 0 ? levels.top : 0; // from the start of the block it is quicker to come from above
-    kt_uint32_t group = segment - segment % fan_out;   // first entry of the group of 16 that is looked through
-    kt_uint32_t from  = segment;
+    // From the start of the block it is quicker to come from above.
+    walk_t      walk{levels, segment == 0 ? levels.top : 0, segment - segment % fan_out, 0};
+    kt_uint32_t from = segment;
     for (;;) {
-        const kt_uint32_t   end      = std::min(group + fan_out, levels.count[level]);
-        const kt_uint32_t * p_bounds = levels.p_bounds[level];
-        kt_uint32_t         greatest = 0;
-        kt_uint32_t         i        = from;
-        for (; i < end && p_bounds[i] < length; ++i)
-            greatest = std::max(greatest, p_bounds[i]);
-        if (i < end) {
-            if (level == 0)
-                return i;
-            --level;
-            group = from = i * fan_out;
-            continue;
+        const kt_uint32_t end = walk.group_end();
+        while (from < end && walk.bounds()[from] < length)
+            ++from;
+        if (from < end) {
+            if (walk.level == 0)
+                return from;
+            walk.go_down(from);
+            from = walk.group;
+        } else {
+            if (!walk.go_up(&from))
+                return nothing;
+            ++from;
         }
-        if (level == levels.top)
-            return nothing;
-        const kt_uint32_t parent = group / fan_out;
-        ++level;
-        if (from == group)
-            levels.p_bounds[level][parent] = greatest;
-        group = parent - parent % fan_out;
-        from  = parent + 1;
     }
 }
 
@@ -172,31 +194,19 @@ kt_uint32_t next_segment(const levels_t & levels, kt_uint32_t segment, kt_uint32
 kt_uint32_t previous_segment(const levels_t & levels, kt_uint32_t segment)
 {
     const bool  from_the_end = segment == levels.count[0];
-    kt_uint32_t level        = from_the_end ? levels.top : 0;
-    kt_uint32_t group        = from_the_end ? 0 : segment - segment % fan_out;
-    kt_uint32_t end          = from_the_end ? 1 : segment;
+    walk_t      walk{levels, from_the_end ? levels.top : 0, from_the_end ? 0 : segment - segment % fan_out, 0};
+    kt_uint32_t end = from_the_end ? 1 : segment;
     for (;;) {
-        kt_uint32_t * const p_bounds = levels.p_bounds[level];
-        kt_uint32_t         i        = end;
-        while (i > group && p_bounds[i - 1] == 0)
-            --i;
-        if (i > group) {
-            if (level == 0)
-                return i - 1;
-            group = (i - 1) * fan_out;
-            --level;
-            end = std::min(group + fan_out, levels.count[level]);
-            continue;
-        }
-        if (level == levels.top)
+        while (end > walk.group && walk.bounds()[end - 1] == 0)
+            --end;
+        if (end > walk.group) {
+            if (walk.level == 0)
+                return end - 1;
+            walk.go_down(end - 1);
+            end = walk.group_end();
+        } else if (!walk.go_up(&end)) {
             return nothing;
-        const bool        whole_group = end > group && end == std::min(group + fan_out, levels.count[level]);
-        const kt_uint32_t parent      = group / fan_out;
-        ++level;
-        if (whole_group)
-            levels.p_bounds[level][parent] = 0;
-        group = parent - parent % fan_out;
-        end   = parent;
+        }
     }
 }
 
@@ -265,7 +275,7 @@ kt_char_ptr_t last_free_below(block_t * p_block)
         return p_record;
     if (const kt_char_ptr_t p_record = last_free_below(p_block->p_left); p_record != nullptr)
         return p_record;
-    p_block->longest_in_subtree = 0;
+    correct_subtree_bound(p_block);
     return nullptr;
 }
 

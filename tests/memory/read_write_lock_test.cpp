@@ -363,9 +363,9 @@ namespace
 // it stays reachable and is left alone.
 const rg_i_read_write_lock_t & lock_after_cancellation(void * (*waiting_thread)(void *), bool hold_for_writing)
 {
-    static std::vector<rg_i_read_write_lock_t *> left_alone;
-    auto * const                                 p_lock = new rg_i_read_write_lock_t;
-    left_alone.push_back(p_lock);
+    static auto * const p_left_alone = new std::vector<rg_i_read_write_lock_t *>; // outlives every destructor
+    auto * const        p_lock       = new rg_i_read_write_lock_t;
+    p_left_alone->push_back(p_lock);
     rg_i_rw_open(p_lock);
     EXPECT_EQ(hold_for_writing ? rg_i_rw_lock_write(p_lock) : rg_i_rw_lock_read(p_lock), 0);
 

@@ -28,6 +28,16 @@ using kt_test::fault_scope;
 namespace
 {
 
+// mt19937 answers with 64 bits of which 32 count.
+struct random_numbers {
+    using result_type = kt_uint32_t;
+    explicit random_numbers(unsigned seed) : engine(seed) {}
+    result_type                  operator()() { return static_cast<result_type>(engine()); }
+    static constexpr result_type min() { return 0; }
+    static constexpr result_type max() { return UINT32_MAX; }
+    std::mt19937                 engine;
+};
+
 // A pool with the calls in one line each; every failure of a call that shouldn't fail fails the test.
 struct test_pool : rg_i_record_buffer_pool_t {
     struct lent_t {
@@ -74,8 +84,8 @@ chain_t chain_of(const rg_i_record_buffer_pool_t & pool)
     chain_t chain;
     for (kt_char_ptr_t p = pool.p_free_chain; p != nullptr;) {
         const auto * const p_head = reinterpret_cast<const rg_i_record_metadata_t *>(p);
-        EXPECT_EQ(p_head->type, RG_RECORD_TYPE_FREE);
-        chain.emplace_back(p, p_head->record_length);
+        EXPECT_EQ(+p_head->type, RG_RECORD_TYPE_FREE);
+        chain.emplace_back(p, +p_head->record_length);
         p = p_head->p_next;
     }
     return chain;
@@ -349,7 +359,7 @@ TEST(taking_room, all_of_it_leaves_no_remainder_and_unlinks_the_record)
     pool.allocate(lent, lent.length, RG_RECORD_TYPE_METADATA);
     EXPECT_EQ(pool.p_free_chain, nullptr);
     EXPECT_EQ(pool.used_bytes, pool.total_bytes);
-    EXPECT_EQ(rg_i_record_head(lent.p_data)->type, RG_RECORD_TYPE_METADATA);
+    EXPECT_EQ(+rg_i_record_head(lent.p_data)->type, RG_RECORD_TYPE_METADATA);
     EXPECT_EQ(record_length(lent.p_data), 10020u);
 }
 
@@ -391,7 +401,7 @@ TEST(taking_room, more_than_was_lent_gives_15_and_changes_nothing)
               RG_E_INTERNAL);
     EXPECT_EQ(chain_of(pool), chain);
     EXPECT_EQ(pool.used_bytes, 32u);
-    EXPECT_EQ(rg_i_record_head(lent.p_data)->type, RG_RECORD_TYPE_FREE);
+    EXPECT_EQ(+rg_i_record_head(lent.p_data)->type, RG_RECORD_TYPE_FREE);
 }
 
 TEST(taking_room, a_record_between_others_keeps_the_chain_around_it)
@@ -406,12 +416,12 @@ TEST(taking_room, a_record_between_others_keeps_the_chain_around_it)
     EXPECT_EQ(lent.p_previous, head(records[2]));
     const auto p_big = pool.allocate(lent, 100);
     EXPECT_EQ(chain_of(pool),
-              (chain_t{{head(records[0]), 60}, {head(records[2]), 60}, {p_big + 100, 10020 - 300 - 120}}));
+              (chain_t{{head(records[0]), 60}, {head(records[2]), 60}, {p_big + 100, 4020 - 300 - 120}}));
     // The middle one goes whole, though 10 bytes of it aren't asked for.
     pool.allocate(pool.find(40), 40);
     pool.allocate(pool.find(30), 30);
     EXPECT_EQ(record_length(records[2]), 60u);
-    EXPECT_EQ(chain_of(pool), (chain_t{{p_big + 100, 10020 - 300 - 120}}));
+    EXPECT_EQ(chain_of(pool), (chain_t{{p_big + 100, 4020 - 300 - 120}}));
     EXPECT_EQ(pool.used_bytes, used_bytes_by_records(pool));
 }
 
@@ -442,7 +452,7 @@ TEST(freeing_records, everything_freed_leaves_32_used_bytes_a_block)
 {
     test_pool                  pool;
     std::vector<kt_char_ptr_t> records;
-    std::mt19937               random(1);
+    random_numbers             random(1);
     for (int i = 0; i < 2000; ++i)
         records.push_back(pool.allocate(random() % 500));
     std::shuffle(records.begin(), records.end(), random);
@@ -461,7 +471,7 @@ TEST(freeing_records, the_data_is_not_cleared_by_it)
     std::memset(p_data, 0x77, 100);
     pool.free(p_data);
     EXPECT_EQ(p_data[50], 0x77);
-    EXPECT_EQ(rg_i_record_head(p_data)->type, RG_RECORD_TYPE_FREE);
+    EXPECT_EQ(+rg_i_record_head(p_data)->type, RG_RECORD_TYPE_FREE);
 }
 
 TEST(freeing_records, pieces_of_a_record_that_was_cut_up_by_its_owner_go_back_one_by_one)
@@ -513,8 +523,8 @@ TEST(freeing_records, the_bare_insertion_walks_a_chain_that_no_pool_owns)
     EXPECT_EQ(rg_i_rb_insert_free_record(record(150, 50), &p_chain, &p_previous), 70u);
     EXPECT_EQ(p_previous, &block[60]);
     const auto * const p_head = reinterpret_cast<rg_i_record_metadata_t *>(p_chain);
-    EXPECT_EQ(p_head->record_length, 180u);
-    EXPECT_EQ(p_head->p_next, nullptr);
+    EXPECT_EQ(+p_head->record_length, 180u);
+    EXPECT_EQ(+p_head->p_next, nullptr);
 }
 
 // ---- What is zero ----
@@ -586,7 +596,7 @@ TEST(zeroed_room, a_reserved_record_is_zero_and_of_its_type)
     EXPECT_EQ(p_data, lent.p_data);
     EXPECT_TRUE(all_zero(p_data, 300));
     EXPECT_EQ(record_length(p_data), 320u);
-    EXPECT_EQ(rg_i_record_head(p_data)->type, RG_RECORD_TYPE_METADATA);
+    EXPECT_EQ(+rg_i_record_head(p_data)->type, RG_RECORD_TYPE_METADATA);
     EXPECT_EQ(pool.used_bytes, 352u);
     lent = pool.find(1);
     EXPECT_TRUE(all_zero(lent.p_data, lent.length));
@@ -627,7 +637,7 @@ class model
     {
         for (int i = 0; i < operations && !testing::Test::HasFailure(); ++i) {
             const unsigned kind = random_() % 16;
-            if (records_.size() >= most_records || (kind < 6 && !records_.empty()))
+            if (records_.size() >= most_records || (kind < 5 && !records_.empty()))
                 free_one();
             else if (kind < 9)
                 build(&test_pool::find, true, longest);
@@ -659,7 +669,7 @@ class model
 
     kt_uint32_t some_length(kt_uint32_t longest)
     {
-        if (random_() % 2000 == 0)
+        if (longest > 1000 && random_() % 2000 == 0)
             return 65530 + random_() % 12;
         return random_() % 8 == 0 ? random_() % 24 : random_() % longest;
     }
@@ -781,7 +791,7 @@ class model
 
     void give_all_back_now_and_then()
     {
-        if (random_() % 200 != 0)
+        if (random_() % 500 != 0)
             return;
         while (!records_.empty() && !testing::Test::HasFailure())
             free_one();
@@ -799,7 +809,7 @@ class model
         ASSERT_EQ(blocks_of(pool_).size(), blocks_);
     }
 
-    std::mt19937        random_;
+    random_numbers      random_;
     test_pool           pool_;
     free_list           free_;
     std::vector<kept_t> records_;
@@ -813,7 +823,7 @@ class model
 TEST(any_sequence_of_calls, does_what_walking_the_chain_does_with_small_records)
 {
     model m(11);
-    m.run(120000, 60, 400, 50);
+    m.run(120000, 60, 700, 100);
     EXPECT_GT(m.blocks(), 5u);
 }
 
@@ -821,16 +831,16 @@ TEST(any_sequence_of_calls, does_what_walking_the_chain_does_with_records_of_all
 {
     for (unsigned seed = 1; seed <= 4; ++seed) {
         model m(seed);
-        m.run(20000, 700, 300, 50);
-        EXPECT_GT(m.blocks(), 3u);
+        m.run(20000, 700, 900, 200);
+        EXPECT_GT(m.blocks(), 2u);
     }
 }
 
 TEST(any_sequence_of_calls, does_what_walking_the_chain_does_in_many_small_blocks)
 {
     model m(21);
-    m.run(40000, 4, 2000, 200);
-    EXPECT_GT(m.blocks(), 20u);
+    m.run(60000, 4, 5000, 500);
+    EXPECT_GT(m.blocks(), 50u);
 }
 
 TEST(any_sequence_of_calls, does_what_walking_the_chain_does_in_long_chains)
@@ -892,12 +902,12 @@ TEST(duplicating_pools, three_blocks_become_one_that_is_24_bytes_smaller)
 
 TEST(duplicating_pools, the_copy_goes_on_as_a_pool_in_address_order)
 {
-    std::mt19937 random(5);
+    random_numbers random(5);
     for (int round = 0; round < 20; ++round) {
         test_pool                  pool;
         std::vector<kt_char_ptr_t> records;
         for (int i = 0; i < 400; ++i)
-            records.push_back(pool.allocate(random() % (round % 2 == 0 ? 40u : 4000u)));
+            records.push_back(pool.allocate(1 + random() % (round % 2 == 0 ? 40u : 4000u)));
         std::shuffle(records.begin(), records.end(), random);
         for (int i = 0; i < 200; ++i, records.pop_back())
             pool.free(records.back());
