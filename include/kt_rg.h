@@ -298,8 +298,57 @@ kt_int32_t rg_close_table_1(rg_opaque_handle_t table_handle);
 
 /* ---- Transactions ---------------------------------------------------------------------------------------------- */
 
+/* A transaction is all that was changed in a table since its last commit. Apply writes it to the table's file and syncs
+ * it, without letting anybody see it there; commit lets it in; abort throws it away. On a table without explicit
+ * control each update does all this before it returns, and these calls find nothing to do. A table without a file
+ * passes the same states in memory. See docs/ARCHITECTURE.md for the road of an update, docs/RELIABILITY.md for what a
+ * returned commit means. All three are thread-safe; they and the updates of a process run one at a time. */
+
+/* Writes what is pending behind the table's live commit record, or, if the table is long and less than half of it is
+ * live, the whole table into a rewrite file; then syncs. A reader of the file still sees the state before. Until
+ * rg_commit_1 or rg_abort_1 the table takes no updates. With nothing pending the table still gets a new change counter.
+ *
+ *   table_change_counter  what the commit makes the table's change counter, even if it is lower; 0: one more than now.
+ *                         A table without explicit control counts by itself and ignores it
+ *
+ * Returns 0 or, with the table's contents and what is pending as they were, so that it may be called again:
+ *   RG_E_INVALID_HANDLE       table_handle is NULL
+ *   RG_E_ACCESS               the table isn't open for writing, or there is no permission to make the rewrite file
+ *   RG_E_APPLIED_UNCOMMITTED  it is applied already
+ *   RG_E_NO_MEMORY            no memory
+ *   RG_E_FILESYSTEM_FULL_DETAIL, RG_E_SYSTEM_CALL  the file could not be written; with "writev" and EFBIG it would
+ *                             have passed the 4 GiB that a table can have
+ *   RG_E_INTERNAL             in a forked child, without an error record */
 kt_int32_t rg_apply_1(rg_opaque_handle_t table_handle, kt_uint64_t table_change_counter);
+
+/* Makes what was applied the table's state, with one act that a crash can't split: a 4-byte overwrite, or a rename.
+ * With nothing pending and nothing applied it does nothing.
+ *
+ * Returns 0 or, with the table still applied:
+ *   RG_E_INVALID_HANDLE   table_handle is NULL
+ *   RG_E_ACCESS           the table isn't open for writing, or there is no permission to rename its file
+ *   RG_E_UNAPPLIED_TABLE  updates are pending that were not applied; nothing has changed
+ *   RG_E_NO_MEMORY        no memory for a name, after a rewrite
+ *   RG_E_FILESYSTEM_FULL_DETAIL, RG_E_SYSTEM_CALL  the file could not be written, renamed or synced
+ *   RG_E_INTERNAL         in a forked child, without an error record
+ * After a failure call rg_abort_1. A failed rewrite can only be aborted: its file is gone.
+ *
+ * One success isn't: if the overwrite could not be synced, and was taken back with success, the result is 0 and the
+ * table is still applied, which the next update shows with RG_E_APPLIED_UNCOMMITTED. docs/RELIABILITY.md tells how to
+ * notice, and what the file may hold then. */
 kt_int32_t rg_commit_1(rg_opaque_handle_t table_handle);
+
+/* Throws away what is pending or applied: the table is as its last commit left it. Legal at any time.
+ *
+ * Ahead of an apply this touches no file. Behind one that appended, the file is cut at the length that the table had in
+ * memory when it was opened, and emptied in the process that created it: what was committed since may be cut off too.
+ * So abort an applied table only if it was opened, and not committed since. docs/RELIABILITY.md tells the details.
+ *
+ * Returns 0 or:
+ *   RG_E_INVALID_HANDLE  table_handle is NULL
+ *   RG_E_ACCESS          the table isn't open for writing
+ *   RG_E_INTERNAL        in a forked child, without an error record
+ * What goes wrong with the file is not an error: it can leave nothing but dead bytes. */
 kt_int32_t rg_abort_1(rg_opaque_handle_t table_handle);
 
 /* ---- Adding rows ----------------------------------------------------------------------------------------------- */

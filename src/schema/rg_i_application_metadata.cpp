@@ -48,6 +48,9 @@ constexpr size_t length_word = sizeof(kt_uint32_t);
 // The first element whose type isn't below the one sought. The set is so small that a walk is the fastest search.
 [[nodiscard]] kt_uint32_t position_for(const rg_i_application_metadata_t * p_set, kt_uint32_t type)
 {
+    // Elements come in ascending order when a table is opened: a long set is filled without a walk for each.
+    if (p_set->total_elements > 0 && p_set->p_index[p_set->total_elements - 1].type < type)
+        return p_set->total_elements;
     kt_uint32_t position = 0;
     while (position < p_set->total_elements && p_set->p_index[position].type < type)
         ++position;

@@ -52,8 +52,9 @@ bool fails(call which, unsigned * p_number = nullptr)
     if (p_number != nullptr)
         *p_number = number;
     if (p.action_at.load() == number) {
-        p.action_at = 0;
-        p.action();
+        p.action_at       = 0;
+        const auto action = std::move(p.action); // it may plan another one
+        action();
     }
     const unsigned from = p.fail_from.load();
     if (from == 0 || number < from || number - from >= p.fail_times)
