@@ -7,6 +7,8 @@
 #include <cstring>
 #include <filesystem>
 #include <string>
+#include <thread>
+#include <vector>
 
 #include "frame/rg_i_trace.h"
 #include "support/faults.h"
@@ -401,4 +403,24 @@ TEST(capturing_an_errno, does_nothing_where_the_file_cannot_be_made)
     std::filesystem::create_directory(errno_file_name());
     rg_i_capture_errno(text("f"), 5, 1, text("v"));
     EXPECT_TRUE(std::filesystem::is_empty(errno_file_name()));
+}
+
+// ---- Threads ----
+
+TEST(threads_report, failures_while_levels_change_and_each_sees_its_own_record)
+{
+    const trace_catcher      registered(0, 0);
+    std::vector<std::thread> threads;
+    tr_set_sink_1([](void *, const tr_event_t *) {}, nullptr);
+    for (const kt_int32_t code : {200, 201, 203})
+        threads.emplace_back([code] {
+            for (int round = 0; round < 200; ++round) {
+                EXPECT_EQ(rg_i_fail(SITE, code), code);
+                EXPECT_EQ(error_code(), code);
+            }
+        });
+    for (int round = 0; round < 200; ++round)
+        EXPECT_EQ(tr_set_level_1("_RGA", "Errors", static_cast<kt_uint32_t>(round % 2)), 0);
+    for (std::thread & thread : threads)
+        thread.join();
 }
