@@ -161,7 +161,7 @@ kt_char_ptr_t rg_i_row_key(const rg_i_table_t * p_table, kt_char_ptr_t p_record_
     kt_char_ptr_t p_key = rg_i_row_indirect_data(p_record_data, p_table->total_columns) + anchor.offset;
     if (key_type == KT_CHAR_PTR)
         return anchor.length > 0 && p_key[anchor.length - 1] == '\0' ? p_key : nullptr;
-    return anchor.length >= sizeof(kt_resource_handle_t) ? p_key : nullptr;
+    return key_type == KT_RSRC_HANDLE_PTR && anchor.length >= sizeof(kt_resource_handle_t) ? p_key : nullptr;
 }
 
 kt_char_ptr_t rg_i_default_data(const rg_i_table_t * p_table)

@@ -486,6 +486,16 @@ TEST(the_key_of_a_record, is_none_for_a_handle_of_fewer_than_twenty_bytes)
     EXPECT_EQ(rg_i_row_key(table.get(), make_record(table.get(), {anchor(0, 0)}, image)), nullptr);
 }
 
+TEST(the_key_of_a_record, is_none_for_a_type_that_no_key_can_have)
+{
+    lone_table table(string_columns());
+    for (const kt_data_type_t type : {KT_BINARY_PTR, KT_SD_PTR, KT_SBS_PTR, KT_INT32_ARRAY, KT_SD_PTR_ARRAY}) {
+        table->p_columns[0].type = type; // as only a damaged file says
+        EXPECT_EQ(rg_i_row_key(table.get(), make_record(table.get(), {anchor(0, 20), int64(0)}, std::string(20, '\0'))),
+                  nullptr);
+    }
+}
+
 // ---- The small ones ----
 
 TEST(an_empty_value, takes_the_place_of_a_null_pointer_of_each_indirect_type)
