@@ -178,6 +178,8 @@ rg_i_index_entry_t *     rg_i_rows_free_chain_remove(rg_i_table_t * p_table);
                                                       kt_uint32_t deletion);
 [[nodiscard]] kt_int32_t rg_i_add_change_entry(rg_i_table_t * p_table, rg_i_index_entry_t * p_index_entry);
 void                     rg_i_free_change_lists(rg_i_table_t * p_table);
+// Takes this free slot off the chain.
+void rg_i_rows_free_chain_take(rg_i_table_t * p_table, rg_i_index_entry_t * p_entry);
 // Takes a row out of the table for good: its hash element, whichever record it still has, its packed position, its
 // slot.
 [[nodiscard]] kt_int32_t rg_i_remove_row(rg_i_table_t * p_table, rg_i_index_entry_t * p_index_entry);

@@ -418,10 +418,13 @@ void free_in_memory(const open_t & open, const cursor_t & cursor)
     if (const kt_int32_t rc = find_row_slot(open, cursor, replaces_offset, RG_E_BAD_REPLACES_OFFSET, &slot); rc != 0)
         return rc;
     *p_p_entry = &table.p_rows_fixed_index[slot];
-    // The row was deleted since, so its slot is free: the version comes in as a new row. Deletions that hit the wrong
-    // row make such files.
-    if ((*p_p_entry)->p_applied == nullptr)
-        return take_new_slot(table, p_p_entry);
+    if ((*p_p_entry)->p_applied == nullptr) {
+        // The row was deleted since, and its slot is free: it comes back. Deletions that hit the wrong row make such
+        // files.
+        rg_i_rows_free_chain_take(&table, *p_p_entry);
+        ++table.total_applied_rows;
+        return 0;
+    }
     rg_i_rb_free_record(&table.record_buffer_pool, (*p_p_entry)->p_applied);
     return 0;
 }

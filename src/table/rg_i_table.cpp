@@ -305,6 +305,20 @@ rg_i_index_entry_t * rg_i_rows_free_chain_remove(rg_i_table_t * p_table)
     return p_entry;
 }
 
+void rg_i_rows_free_chain_take(rg_i_table_t * p_table, rg_i_index_entry_t * p_entry)
+{
+    const kt_uint32_t slot    = rg_i_fixed_row_index(p_table, p_entry);
+    kt_uint64_t *     p_words = free_slot_index(p_table);
+    assert(rg_i_free_slot_index_contains(p_words, slot));
+    const kt_uint32_t below = rg_i_free_slot_index_below(p_words, p_table->maximum_rows, slot);
+    if (below == RG_I_NO_SLOT)
+        p_table->p_rows_free_chain = static_cast<rg_i_index_entry_t *>(p_entry->p_pending_change);
+    else
+        p_table->p_rows_fixed_index[below].p_pending_change = p_entry->p_pending_change;
+    p_entry->p_pending_change = nullptr;
+    rg_i_free_slot_index_remove(p_words, p_table->maximum_rows, slot);
+}
+
 kt_int32_t rg_i_remove_row(rg_i_table_t * p_table, rg_i_index_entry_t * p_index_entry)
 {
     if (p_table->p_rows_hash_table != nullptr && p_index_entry->p_hash_table_element != nullptr)
