@@ -60,7 +60,7 @@ struct rg_i_record_buffer_pool_t {
     kt_char_ptr_t              p_free_chain; // head of the first free record; ascending address order
     rg_i_record_buffer_t *     p_first_record_buffer; // first block
     rg_i_record_buffer_t *     p_last_record_buffer;  // last block
-    rg_i_free_record_index_t * p_free_index;          // owned; NULL while the pool has no block
+    rg_i_free_record_index_t * p_free_index;          // stands behind the first block; NULL while the pool has no block
 };
 
 static_assert(offsetof(rg_i_record_buffer_pool_t, p_free_chain) == 8 &&
@@ -68,11 +68,12 @@ static_assert(offsetof(rg_i_record_buffer_pool_t, p_free_chain) == 8 &&
 
 // How the addresses in one pool map to its copy: one array element per source block.
 struct rg_i_record_buffer_pool_duplication_map_t {
-    kt_uint32_t     total;    // source blocks
-    kt_char_ptr_t * p_begin;  // first byte behind each block's head
-    kt_char_ptr_t * p_end;    // first byte behind each block
-    kt_int32_t *    p_offset; // destination minus source, cut to 32 bits
-    kt_char_ptr_t * p_to;     // where each block's first byte went: right at any distance
+    kt_uint32_t     total;        // source blocks
+    kt_char_ptr_t * p_begin;      // first byte behind each block's head
+    kt_char_ptr_t * p_end;        // first byte behind each block
+    kt_int32_t *    p_offset;     // destination minus source, cut to 32 bits
+    kt_char_ptr_t * p_to;         // where each block's first byte went: right at any distance
+    kt_uint32_t *   p_by_address; // numbers of the blocks in ascending address order
 };
 
 [[nodiscard]] inline rg_i_record_metadata_t * rg_i_record_head(kt_char_ptr_t p_data)
@@ -113,7 +114,8 @@ kt_uint32_t rg_i_rb_insert_free_record(kt_char_ptr_t p_new_free_record, kt_char_
 // The same two steps for builders that write every byte they take (rows): the room is handed out as it is, so that the
 // cost doesn't grow with the free record, and only what is taken beyond data_length is zeroed.
 //
-// A builder that gives up after writing into the lent room must say how far it wrote with rg_i_rb_give_back_record.
+// A builder that gives up after writing into the lent room, or takes less than it wrote, must say how far it wrote with
+// rg_i_rb_give_back_record: the pool relies on the rest still being zero.
 [[nodiscard]] kt_int32_t rg_i_rb_lend_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_uint32_t data_length,
                                              kt_char_ptr_t * p_data, kt_char_ptr_t * p_previous_free_record,
                                              kt_uint32_t * actual_data_length);

@@ -1,0 +1,75 @@
+// SPDX-License-Identifier: MIT
+// rg_i_free_record_index: leads to the places of a pool's free chain that walking the chain would lead to.
+//
+// The chain itself stays what it is: records linked in ascending address order. Beside it each block carries, behind
+// its last record and in the same heap block, a summary of the free records that start in it, and the blocks form a
+// tree by address. So neither a search nor the return of a record costs in proportion to the chain, and since the room
+// for the index comes with the block, keeping it can't fail.
+//
+// Used by the record pool alone. The pool links and unlinks the records, and tells the index what it did.
+#pragma once
+
+#include "rg_i_record_buffer_pool.h"
+
+// What a block carries behind its records. Segments are 1 KiB of the block each.
+struct rg_i_block_index_t {
+    rg_i_record_buffer_t * p_block;
+    rg_i_block_index_t *   p_left; // the tree of blocks, by address
+    rg_i_block_index_t *   p_right;
+    rg_i_block_index_t *   p_parent;
+    kt_uint32_t            longest_in_subtree; // no free record in this block or the blocks below is longer
+    kt_uint32_t            priority;           // no block below has a higher one
+    kt_uint32_t            clean_from;         // from this byte of the block on, it is zero as it came from the heap
+    kt_uint32_t            segments;
+    kt_uint32_t            bounds;    // entries of p_longest; the last one is for the whole block
+    kt_uint32_t *          p_longest; // by segment, then by 16 segments, by 256 ...: no free record there is longer
+    kt_uint16_t *          p_first;   // by segment: 1 + place in it of its first free record; 0: none starts there
+};
+
+// A free record with its surroundings. No record: p_record is NULL.
+struct rg_i_free_place_t {
+    kt_char_ptr_t        p_record;
+    kt_char_ptr_t        p_previous; // the free record before it in the chain; NULL: it is the first
+    rg_i_block_index_t * p_block;
+};
+
+// The root, which stands behind the first block's own index.
+struct rg_i_free_record_index_t {
+    rg_i_block_index_t * p_root;
+    rg_i_block_index_t * p_recent; // the block that an address was last found in
+    // Where the last search ended: every free record before it is shorter than hint_length. So a search for that length
+    // or more can begin there, and a run of allocations from one free record doesn't search at all.
+    rg_i_free_place_t hint;
+    kt_uint32_t       hint_length;
+    bool              hint_previous_known; // p_previous can get lost; p_block does when it is NULL
+};
+
+// Makes a block of total_bytes, zeroed but for its head, with room for the index behind, and for the root if it is the
+// first of its pool. NULL: no memory.
+[[nodiscard]] rg_i_record_buffer_t * rg_i_make_indexed_block(kt_uint32_t total_bytes, bool first_of_pool);
+
+// Enters a block that has no free records yet. If the pool has no index so far, the block brings it.
+rg_i_block_index_t * rg_i_index_block(rg_i_free_record_index_t ** p_p_index, rg_i_record_buffer_t * p_block);
+
+// The block that an address lies in, or NULL.
+[[nodiscard]] rg_i_block_index_t * rg_i_block_of(rg_i_free_record_index_t * p_index, const kt_char_t * p_address);
+
+// The first free record of at least that length, in address order.
+[[nodiscard]] rg_i_free_place_t rg_i_first_fit(rg_i_free_record_index_t * p_index, kt_uint32_t record_length);
+// The last free record that starts before the address, which lies in the block; NULL if there is none.
+[[nodiscard]] kt_char_ptr_t rg_i_last_free_before(rg_i_block_index_t * p_block, const kt_char_t * p_address);
+// The first free record of the block, or NULL.
+[[nodiscard]] kt_char_ptr_t rg_i_first_free_in(rg_i_block_index_t * p_block);
+
+// What the pool has done to the chain. The lengths are those that stand in the records now.
+void rg_i_note_free(rg_i_block_index_t * p_block, kt_char_ptr_t p_record);
+void rg_i_note_grown(rg_i_block_index_t * p_block, kt_char_ptr_t p_record);
+// The record isn't free any more; p_next is what its link led to.
+void rg_i_note_gone(rg_i_block_index_t * p_block, kt_char_ptr_t p_record, kt_char_ptr_t p_next);
+
+// The same for the hint: a record was taken and p_rest (NULL: nothing) stands in its place, or p_record came into being
+// or grew, with p_absorbed (or NULL) swallowed by it from behind. p_previous as the pool knows it.
+void rg_i_move_hint_after_taking(rg_i_free_record_index_t * p_index, kt_char_ptr_t p_taken, kt_char_ptr_t p_previous,
+                                 kt_char_ptr_t p_rest, kt_char_ptr_t p_next);
+void rg_i_move_hint_after_freeing(rg_i_free_record_index_t * p_index, const rg_i_free_place_t & freed,
+                                  bool previous_known, kt_char_ptr_t p_absorbed);
