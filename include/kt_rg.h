@@ -541,6 +541,42 @@ kt_int32_t rg_set_application_metadata_1(rg_opaque_handle_t table_handle, kt_bin
  * Thread-safe: any number of readers run together, in a forked child too. See docs/ARCHITECTURE.md. */
 kt_int32_t rg_get_application_metadata_1(rg_opaque_handle_t table_handle, kt_binary_t ** p_p_binary);
 
+/* ---- Packed tables ---------------------------------------------------------------------------------------------
+ *
+ * One contiguous buffer with any number of tables: names, columns and rows. It may be sent to another process by
+ * whatever means, also to a machine of another byte order. There it is converted in place, if need be, and each of its
+ * tables can be made a read-only table of a tree. docs/PACKED-FORMAT.md tells the buffer byte by byte. */
+
+/* Packs tables into one buffer.
+ *
+ *   total_tables                   how many; 0 gives a buffer without tables, and the arrays aren't looked at
+ *   p_table_handles                the tables, in the order that the buffer will have. One may stand there twice. They
+ *                                  must stay open until the call returns
+ *   p_uncommitted_updates_visible  for each table, non-zero: pack it with its uncommitted updates; 0: as committed.
+ *                                  What the table's readers see plays no part
+ *   p_total_row_fixed_indices      for each table, how many rows are chosen; 0: all of its rows, in the order of their
+ *                                  fixed indices. So no table can be packed without rows while it has some
+ *   p_row_fixed_indices            the fixed indices of the chosen rows, the runs of the tables one behind the other;
+ *                                  in any order, and repeated at will. NULL if no table has any
+ *   p_p_buffer                     receives the buffer, which the caller releases with free. Its first word is its
+ *                                  length
+ *
+ * Returns 0 or, with *p_p_buffer as it was:
+ *   RG_E_NULL_POINTER    an array or p_p_buffer is NULL
+ *   RG_E_INVALID_HANDLE  a handle is NULL
+ *   RG_E_ROW_DELETED     a chosen row isn't there in the role asked for: no row has that index, its deletion is
+ *                        pending, or it isn't committed yet
+ *   RG_E_NO_MEMORY       no memory
+ *   RG_E_LIBRARY_CALL    a default value is damaged, or the buffer would exceed 4 GiB - 1
+ *   RG_E_INTERNAL        a definition of structured data has field names so short that its packed form can't be walked
+ *   RG_E_SYSTEM_CALL     a lock fails
+ * Thread-safe; also in a forked child. All tables are read-locked together, so the buffer holds one moment. A default of
+ * structured data doesn't travel, nor does the application's own binary. See docs/PACKED-FORMAT.md,
+ * docs/BAD-INPUT.md. */
+kt_int32_t rg_pack_tables_1(kt_uint32_t total_tables, rg_opaque_handle_t * p_table_handles,
+                            kt_uint32_t * p_uncommitted_updates_visible, kt_uint32_t * p_total_row_fixed_indices,
+                            kt_uint32_t * p_row_fixed_indices, void ** p_p_buffer);
+
 #pragma GCC visibility pop
 #ifdef __cplusplus
 }

@@ -43,6 +43,9 @@ struct rg_i_record_metadata_t {
 
 inline constexpr kt_uint32_t RG_I_RECORD_BUFFER_HEAD_LENGTH = 12;
 inline constexpr kt_uint32_t RG_I_RECORD_HEAD_LENGTH        = 20;
+// Bytes behind a record that may be read. A record is packed as a binary whose length word counts itself, so packing
+// copies four bytes more than the record has. Behind the last record of a block they are zero.
+inline constexpr kt_uint32_t RG_I_RECORD_OVERHANG = 4;
 
 static_assert(sizeof(rg_i_record_buffer_t) == RG_I_RECORD_BUFFER_HEAD_LENGTH);
 static_assert(offsetof(rg_i_record_buffer_t, total_bytes) == 8);

@@ -364,7 +364,7 @@ struct layout_t {
     {
         segments    = total_bytes / segment_length + 1;
         bounds      = count_of_bounds(segments);
-        block_index = rounded(total_bytes) + guard_length;
+        block_index = rounded(std::size_t{total_bytes} + RG_I_RECORD_OVERHANG) + guard_length;
         longest     = block_index + sizeof(block_t);
         first       = longest + std::size_t{bounds} * sizeof(kt_uint32_t);
         root        = rounded(first + std::size_t{segments} * sizeof(kt_uint16_t));
@@ -383,7 +383,8 @@ rg_i_record_buffer_t * rg_i_make_indexed_block(kt_uint32_t total_bytes, bool fir
         return nullptr;
     p_block->total_bytes = total_bytes;
 #if defined(__SANITIZE_ADDRESS__)
-    ASAN_POISON_MEMORY_REGION(reinterpret_cast<kt_char_ptr_t>(p_block) + total_bytes, layout.block_index - total_bytes);
+    const std::size_t readable = std::size_t{total_bytes} + RG_I_RECORD_OVERHANG;
+    ASAN_POISON_MEMORY_REGION(reinterpret_cast<kt_char_ptr_t>(p_block) + readable, layout.block_index - readable);
 #endif
     return p_block;
 }
