@@ -1,8 +1,9 @@
-# The message catalog, share/kt_rg.cat in the build tree, and its source beside it, which translators start from.
+# The message catalog, share/kt_rg.cat in the build tree, and its source kt_rg.msg beside it.
 #
-# Installed as share/locale/C/LC_MESSAGES/kt_rg.cat: with the prefix /usr that is where catopen looks by itself, with
-# any other set NLSPATH=<prefix>/share/locale/%L/LC_MESSAGES/%N. A translation goes to the same place under its locale's
-# name. Where there is no catalog the library's built-in texts stand, which are the same.
+# The catalog is installed as share/locale/en/LC_MESSAGES/kt_rg.cat: with the prefix /usr that is where catopen looks by
+# itself in an English locale; with any other, set NLSPATH=<prefix>/share/locale/%l/LC_MESSAGES/%N. A translation is made
+# from share/kt_rg/kt_rg.msg with gencat, and goes to the same place under its own language. In the locale C, and where
+# there is no catalog, the library's built-in texts stand, which are the same.
 find_program(KT_GENCAT gencat REQUIRED)
 
 add_executable(kt_rg_catalog_source ${PROJECT_SOURCE_DIR}/tools/catalog/kt_rg_catalog.cpp)
@@ -21,4 +22,5 @@ add_custom_command(
   VERBATIM)
 add_custom_target(kt_rg_catalog ALL DEPENDS ${KT_CATALOG})
 
-install(FILES ${KT_CATALOG} DESTINATION ${CMAKE_INSTALL_LOCALEDIR}/C/LC_MESSAGES)
+install(FILES ${KT_CATALOG} DESTINATION ${CMAKE_INSTALL_LOCALEDIR}/en/LC_MESSAGES)
+install(FILES ${CMAKE_BINARY_DIR}/share/kt_rg.msg DESTINATION ${CMAKE_INSTALL_DATADIR}/kt_rg)

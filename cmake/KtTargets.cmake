@@ -37,7 +37,8 @@ function(kt_add_library name)
   target_link_libraries(${name} PRIVATE $<BUILD_INTERFACE:kt_library_options> Threads::Threads)
   target_link_options(${name} PRIVATE -Wl,--version-script=${ARG_EXPORTS} -Wl,--no-undefined-version)
   set_target_properties(${name} PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
-                                           LINK_DEPENDS ${ARG_EXPORTS})
+                                           LINK_DEPENDS ${ARG_EXPORTS}
+                                           INSTALL_RPATH "$ORIGIN") # the libraries find each other under any prefix
   if(NOT KT_SANITIZE)
     target_link_options(${name} PRIVATE -Wl,--no-undefined)
   endif()
