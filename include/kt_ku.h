@@ -1,7 +1,7 @@
 /* SPDX-License-Identifier: MIT
  *
  * kt_ku.h: the utility library: the error record, locale and string conversion, the data type class table, the shared
- * empty values and the comparison of resource handles.
+ * empty values, the comparison of resource handles, and the selection language.
  *
  * All functions may be called from several threads at once. None starts a thread or holds a lock when it returns. What
  * they do on input out of the ordinary is told in docs/BAD-INPUT.md.
@@ -154,6 +154,86 @@ extern const kt_array_ptr_t           ku_ptr_empty_array_1;
  * if they are equal, else -1 or 1: the order of the first words that differ. Has the form of a compare function of a
  * hashed table. */
 kt_int32_t ku_rsrc_hndl_cmp_1(void * p_handle1, void * p_handle2);
+
+/* ---- The selection language ------------------------------------------------------------------------------------ */
+
+/* The language is told in docs/SELECTION.md. */
+
+/* What ku_comp_expr_1 and ku_exec_expr_1 return besides 0. */
+enum {
+    KU_EXPR_E_SYNTAX          = 1, /* compiling: the text isn't an expression. Running: a NULL argument */
+    KU_EXPR_E_NO_SUCH_NAME    = 2, /* a column or field that the callback doesn't know */
+    KU_EXPR_E_TYPES           = 3, /* types that don't fit together, or an expression that isn't a number */
+    KU_EXPR_E_TOO_LONG        = 4, /* over 1 MiB, over 250 levels of nesting, or too large a regular expression */
+    KU_EXPR_E_NO_MEMORY       = 5,
+    KU_EXPR_E_INTEGER_FAULT   = 6, /* running: a result outside -2^63 to 2^64-1, or a division by zero */
+    KU_EXPR_E_NO_SUCH_ELEMENT = 7, /* running: an index outside its array, a field that a structure doesn't have */
+    KU_EXPR_E_DAMAGED_VALUE   = 8  /* running: a stored value that isn't well formed */
+};
+
+/* What a name stands for. */
+typedef struct ku_validate_data_t {
+    kt_data_type_t type;
+    kt_uint32_t    id; /* of a column: the position of its slot; of a field: its position in the structured data */
+} ku_validate_data_t;
+
+/* Answers what a name stands for.
+ *
+ *   token          as given to ku_comp_expr_1
+ *   p_name         the name, terminated
+ *   length         its bytes without the terminator
+ *   parent_id      0xFFFFFFFF: a column is asked for. Else the id of a column of structured data, or of an array of
+ *                  structured data, whose field is asked for
+ *   p_return_data  receives the answer
+ *
+ * Returns 0, or anything else if there is no such name. */
+typedef kt_int32_t ku_validate_callback_t(void * token, kt_char_t * p_name, kt_uint32_t length, kt_uint32_t parent_id,
+                                          ku_validate_data_t * p_return_data);
+
+/* Compiles an expression.
+ *
+ *   p_text          the expression in UTF-8, terminated, at most 1 MiB
+ *   flags           0; not looked at
+ *   callback        called for each name in the text, in no stated order, possibly more than once for one name
+ *   token           passed to the callback
+ *   p_p_compiled    receives the compiled expression, which goes back through ku_free_expr_1; untouched after a failure
+ *
+ * Returns 0, KU_EXPR_E_SYNTAX (also for a NULL argument), KU_EXPR_E_NO_SUCH_NAME, KU_EXPR_E_TYPES, KU_EXPR_E_TOO_LONG
+ * or KU_EXPR_E_NO_MEMORY. ku_expr_diagnosis_1 tells where and why. Time and memory are in proportion to the text. Sets
+ * no error record. */
+kt_int32_t ku_comp_expr_1(kt_char_ptr_t p_text, kt_uint32_t flags, ku_validate_callback_t callback, void * token,
+                          void ** p_p_compiled);
+
+/* Runs a compiled expression on a row.
+ *
+ *   p_compiled       from ku_comp_expr_1; several threads may run it at once
+ *   flags            16; not looked at
+ *   p_values         the row's first slot; the slots are 8 bytes each, without gaps, at any alignment
+ *   total_values     how many slots the row has
+ *   p_result         receives 1 if the expression is true of the row and 0 otherwise; untouched after a failure
+ *   p_indirect_data  where the offsets of the row's indirect values count from (docs/FILE-FORMAT.md)
+ *
+ * Returns 0; KU_EXPR_E_INTEGER_FAULT; KU_EXPR_E_NO_SUCH_ELEMENT, also for a column at or behind total_values;
+ * KU_EXPR_E_DAMAGED_VALUE; KU_EXPR_E_SYNTAX if a pointer is NULL. A row whose evaluation gives 6, 7 or 8 should count
+ * as not matching. Allocates nothing, sets no error record.
+ *
+ * How far the indirect data goes isn't known here, so every offset is believed: use ku_exec_expr_within_1 on rows that
+ * may be damaged. */
+kt_int32_t ku_exec_expr_1(void * p_compiled, kt_uint32_t flags, const void * p_values, kt_uint32_t total_values,
+                          kt_uint32_t * p_result, const void * p_indirect_data);
+
+/* The same, with the number of bytes that p_indirect_data has: nothing beyond them is read, and a value that would lie
+ * there is KU_EXPR_E_DAMAGED_VALUE. */
+kt_int32_t ku_exec_expr_within_1(void * p_compiled, kt_uint32_t flags, const void * p_values, kt_uint32_t total_values,
+                                 kt_uint32_t * p_result, const void * p_indirect_data, kt_uint32_t indirect_length);
+
+/* Releases a compiled expression that nobody is running any more; NULL is passed over. flags: 0; not looked at. */
+void ku_free_expr_1(void * p_compiled, kt_uint32_t flags);
+
+/* Why the calling thread's last ku_comp_expr_1 failed, such as `column 17: no column named "Nmae"`, with "line 2, " in
+ * front if the text has several lines; "" if it succeeded, or if there was none. Lines and columns count from 1,
+ * columns in characters. Valid until the thread's next ku_comp_expr_1. */
+const kt_char_t * ku_expr_diagnosis_1(void);
 
 #pragma GCC visibility pop
 #ifdef __cplusplus

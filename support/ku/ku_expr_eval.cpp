@@ -1,0 +1,402 @@
+// SPDX-License-Identifier: MIT
+// ku_expr_eval: runs a program on a row.
+//
+// Always holds: the program was built by the compiler, so its types, jumps and stack are right and are not tested here;
+// the row may be anything, so every address that comes from it is. Nothing is allocated and nothing is written but the
+// machine's stack, so several threads may run one program at once.
+// Failure: the first fault ends the run with its code.
+#include "ku_expr.h"
+#include "ku_expr_stored.h"
+#include "ku_regex.h"
+
+#include <algorithm>
+#include <cstring>
+
+namespace
+{
+
+constexpr kt_uint32_t usual_stack = 32;
+
+// ---- Strings ----
+
+ku_text_t text_of(const ku_value_t & value)
+{
+    return {value.bytes.p, value.bytes.length, static_cast<uint8_t>(value.bytes.letters)};
+}
+
+uint8_t order_of(int comparison)
+{
+    return comparison == 0 ? KU_EQUAL : comparison < 0 ? KU_LESS : KU_GREATER;
+}
+
+uint8_t compare_bytes(const uint8_t * p_left, size_t left_length, const uint8_t * p_right, size_t right_length)
+{
+    const size_t common     = std::min(left_length, right_length);
+    const int    comparison = common != 0 ? std::memcmp(p_left, p_right, common) : 0;
+    if (comparison != 0 || left_length == right_length)
+        return order_of(comparison);
+    return left_length < right_length ? KU_LESS : KU_GREATER;
+}
+
+uint8_t compare_shown(const ku_text_t & left, const ku_text_t & right)
+{
+    const uint8_t * p_left_shown  = ku_letter_tables.shown[left.letters];
+    const uint8_t * p_right_shown = ku_letter_tables.shown[right.letters];
+    const size_t    common        = std::min(left.length, right.length);
+    for (size_t i = 0; i < common; i++) {
+        const uint8_t l = p_left_shown[left.p[i]], r = p_right_shown[right.p[i]];
+        if (l != r)
+            return l < r ? KU_LESS : KU_GREATER;
+    }
+    if (left.length == right.length)
+        return KU_EQUAL;
+    return left.length < right.length ? KU_LESS : KU_GREATER;
+}
+
+uint8_t compare_strings(const ku_value_t & left, const ku_value_t & right)
+{
+    if (left.bytes.letters == KU_LETTERS_AS_THEY_ARE && right.bytes.letters == KU_LETTERS_AS_THEY_ARE)
+        return compare_bytes(left.bytes.p, left.bytes.length, right.bytes.p, right.bytes.length);
+    return compare_shown(text_of(left), text_of(right));
+}
+
+bool bytes_are_equal(const ku_value_t & left, const ku_value_t & right)
+{
+    return left.bytes.length == right.bytes.length &&
+           (left.bytes.length == 0 || std::memcmp(left.bytes.p, right.bytes.p, left.bytes.length) == 0);
+}
+
+// Short runs of bytes without a call: the length is the same for every row.
+bool begin_equally(const uint8_t * p, const uint8_t * q, size_t length)
+{
+    if (length > 8)
+        return std::memcmp(p, q, length) == 0;
+    if (length >= 4)
+        return ku_load<uint32_t>(p) == ku_load<uint32_t>(q) &&
+               ku_load<uint32_t>(p + length - 4) == ku_load<uint32_t>(q + length - 4);
+    if (length >= 2)
+        return ku_load<uint16_t>(p) == ku_load<uint16_t>(q) &&
+               ku_load<uint16_t>(p + length - 2) == ku_load<uint16_t>(q + length - 2);
+    return length == 0 || *p == *q;
+}
+
+// ---- Equality by pair of types ----
+
+bool are_equal(uint8_t pair, const ku_value_t & left, const ku_value_t & right)
+{
+    switch (pair) {
+    case KU_PAIR_INTEGERS:
+        return left.integer == right.integer;
+    case KU_PAIR_FLOATINGS:
+        return ku_compare_floats(left.floating, right.floating) == KU_EQUAL;
+    case KU_PAIR_INTEGER_WITH_FLOATING:
+        return ku_compare_int_with_float(left.integer, right.floating) == KU_EQUAL;
+    case KU_PAIR_FLOATING_WITH_INTEGER:
+        return ku_compare_float_with_int(left.floating, right.integer) == KU_EQUAL;
+    case KU_PAIR_STRINGS:
+        return compare_strings(left, right) == KU_EQUAL;
+    default:
+        return bytes_are_equal(left, right);
+    }
+}
+
+// Looks for the value among the elements. The first one that is damaged ends the search.
+[[nodiscard]] kt_int32_t find_in_array(const ku_instruction_t & instruction, const ku_value_t & value,
+                                       const ku_value_t & array, bool * p_found)
+{
+    const ku_extent_t item  = {array.bytes.p, array.bytes.length};
+    const kt_uint32_t count = ku_element_count(array);
+    *p_found                = false;
+    for (kt_uint32_t i = 0; i < count && !*p_found; i++) {
+        ku_value_t element;
+        if (!ku_read_value(instruction.detail, item.p + ku_array_head_size + i * ku_slot_size, item, &element))
+            return KU_EXPR_E_DAMAGED_VALUE;
+        *p_found = are_equal(static_cast<uint8_t>(instruction.operand), value, element);
+    }
+    return 0;
+}
+
+[[nodiscard]] kt_int32_t take_field(const ku_instruction_t & instruction, ku_value_t * p_value)
+{
+    const ku_extent_t item = {p_value->bytes.p, p_value->bytes.length};
+    if (instruction.operand >= ku_element_count(*p_value))
+        return KU_EXPR_E_NO_SUCH_ELEMENT;
+    const uint8_t * p_entry =
+        item.p + ku_array_head_size + static_cast<size_t>(instruction.operand) * ku_sd_element_size;
+    if (ku_load<kt_data_type_t>(p_entry) != instruction.detail)
+        return KU_EXPR_E_DAMAGED_VALUE;
+    return ku_read_value(instruction.detail, p_entry + ku_slot_size, item, p_value) ? 0 : KU_EXPR_E_DAMAGED_VALUE;
+}
+
+[[nodiscard]] kt_int32_t take_element(const ku_instruction_t & instruction, ku_int_t index, ku_value_t * p_value)
+{
+    const ku_extent_t item = {p_value->bytes.p, p_value->bytes.length};
+    if (index < 0 || index >= ku_element_count(*p_value))
+        return KU_EXPR_E_NO_SUCH_ELEMENT;
+    const uint8_t * p_slot = item.p + ku_array_head_size + static_cast<size_t>(index) * ku_slot_size;
+    return ku_read_value(instruction.detail, p_slot, item, p_value) ? 0 : KU_EXPR_E_DAMAGED_VALUE;
+}
+
+// ---- Tests of a column that is a string ----
+
+// What a string column is compared with, and its item. False: the item isn't well formed.
+struct column_string {
+    ku_extent_t     item;
+    const uint8_t * p_literal;
+    kt_uint32_t     literal_length;
+};
+
+bool starts_with(const column_string & c)
+{
+    return c.item.length > c.literal_length && begin_equally(c.item.p, c.p_literal, c.literal_length);
+}
+
+bool test_string(const ku_instruction_t & instruction, const column_string & c)
+{
+    if (instruction.operation == KU_OP_STRING_STARTS_WITH)
+        return starts_with(c);
+    // The literal has no terminator in it, so this tells an equal string without measuring it.
+    if (instruction.operation == KU_OP_STRING_IS && instruction.detail == KU_EQ)
+        return starts_with(c) && c.item.p[c.literal_length] == '\0';
+    const kt_uint32_t length = ku_string_length(c.item);
+    switch (instruction.operation) {
+    case KU_OP_STRING_ENDS_WITH:
+        return length >= c.literal_length &&
+               begin_equally(c.item.p + length - c.literal_length, c.p_literal, c.literal_length);
+    case KU_OP_STRING_CONTAINS:
+        return memmem(c.item.p, length, c.p_literal, c.literal_length) != nullptr;
+    default:
+        return (compare_bytes(c.item.p, length, c.p_literal, c.literal_length) & instruction.detail) != 0;
+    }
+}
+
+// ---- The machine ----
+
+struct row {
+    const uint8_t * p_values;
+    ku_extent_t     indirect;
+};
+
+template <kt_uint32_t Room>
+[[nodiscard]] kt_int32_t run(const ku_program_t & program, const row & the_row, kt_uint32_t * p_result)
+{
+    const ku_constant_t * const    p_constants    = program.constants();
+    const ku_instruction_t * const p_instructions = program.instructions();
+    const ku_instruction_t *       p              = p_instructions;
+    ku_value_t                     stack[Room + 1];
+    ku_value_t *                   p_top = stack; // the topmost value; the lowest one stands at stack[1]
+    bool                           truth = false;
+
+    const auto slot = [&the_row](const ku_instruction_t & i) {
+        return the_row.p_values + static_cast<size_t>(i.operand) * ku_slot_size;
+    };
+    const auto in_range = [&](uint64_t bits) {
+        const auto & range = p_constants[p->constant].range;
+        return bits - range.low <= range.span;
+    };
+
+    for (;; p++) {
+        switch (p->operation) {
+        case KU_OP_END:
+            *p_result = p_top->integer != 0 ? 1 : 0;
+            return 0;
+
+        case KU_OP_INTEGER:
+            (++p_top)->integer = p_constants[p->constant].integer;
+            continue;
+        case KU_OP_FLOATING:
+            (++p_top)->floating = p_constants[p->constant].floating;
+            continue;
+        case KU_OP_TEXT: {
+            const auto & text = p_constants[p->constant].text;
+            (++p_top)->bytes  = {program.texts() + text.offset, text.length, KU_LETTERS_AS_THEY_ARE};
+            continue;
+        }
+        case KU_OP_COLUMN:
+            if (!ku_read_value(p->detail, slot(*p), the_row.indirect, ++p_top))
+                return KU_EXPR_E_DAMAGED_VALUE;
+            continue;
+        case KU_OP_FIELD:
+            if (const kt_int32_t rc = take_field(*p, p_top); rc != 0)
+                return rc;
+            continue;
+        case KU_OP_ELEMENT: {
+            const ku_int_t index = (p_top--)->integer;
+            if (const kt_int32_t rc = take_element(*p, index, p_top); rc != 0)
+                return rc;
+            continue;
+        }
+        case KU_OP_COUNT:
+            p_top->integer = ku_element_count(*p_top);
+            continue;
+        case KU_OP_LENGTH:
+            p_top->integer = p_top->bytes.length;
+            continue;
+        case KU_OP_LETTERS:
+            p_top->bytes.letters = p->detail;
+            continue;
+
+        case KU_OP_TO_FLOATING:
+            p_top->floating = static_cast<double>(p_top->integer);
+            continue;
+        case KU_OP_SECOND_TO_FLOATING:
+            p_top[-1].floating = static_cast<double>(p_top[-1].integer);
+            continue;
+        case KU_OP_NEGATE_INTEGER:
+            if (!ku_int_subtract(0, p_top->integer, &p_top->integer))
+                return KU_EXPR_E_INTEGER_FAULT;
+            continue;
+        case KU_OP_NEGATE_FLOATING:
+            p_top->floating = -p_top->floating;
+            continue;
+        case KU_OP_COMPLEMENT:
+            p_top->integer = ku_int_complement(p_top->integer, p->detail);
+            continue;
+#define KU_INTEGER_OPERATION(operation, function)                                                                      \
+    case operation:                                                                                                    \
+        p_top--;                                                                                                       \
+        if (!function(p_top->integer, p_top[1].integer, &p_top->integer))                                              \
+            return KU_EXPR_E_INTEGER_FAULT;                                                                            \
+        continue;
+            KU_INTEGER_OPERATION(KU_OP_ADD_INTEGERS, ku_int_add)
+            KU_INTEGER_OPERATION(KU_OP_SUBTRACT_INTEGERS, ku_int_subtract)
+            KU_INTEGER_OPERATION(KU_OP_MULTIPLY_INTEGERS, ku_int_multiply)
+            KU_INTEGER_OPERATION(KU_OP_DIVIDE_INTEGERS, ku_int_divide)
+            KU_INTEGER_OPERATION(KU_OP_MODULO_INTEGERS, ku_int_modulo)
+            KU_INTEGER_OPERATION(KU_OP_AND_INTEGERS, ku_int_bits_and)
+            KU_INTEGER_OPERATION(KU_OP_XOR_INTEGERS, ku_int_bits_xor)
+            KU_INTEGER_OPERATION(KU_OP_OR_INTEGERS, ku_int_bits_or)
+#undef KU_INTEGER_OPERATION
+        case KU_OP_ADD_FLOATINGS:
+            p_top--;
+            p_top->floating += p_top[1].floating;
+            continue;
+        case KU_OP_SUBTRACT_FLOATINGS:
+            p_top--;
+            p_top->floating -= p_top[1].floating;
+            continue;
+        case KU_OP_MULTIPLY_FLOATINGS:
+            p_top--;
+            p_top->floating *= p_top[1].floating;
+            continue;
+        case KU_OP_DIVIDE_FLOATINGS:
+            p_top--;
+            p_top->floating /= p_top[1].floating;
+            continue;
+
+        case KU_OP_LIST_ELEMENT:
+            p_top--;
+            if (are_equal(p->detail, *p_top, p_top[1])) {
+                p_top->integer = 1 ^ p->negated;
+                p              = p_instructions + p->target - 1;
+            }
+            continue;
+        case KU_OP_LIST_END:
+            p_top->integer = p->negated;
+            continue;
+
+        case KU_OP_INT32_IN_RANGE:
+            truth = in_range(static_cast<uint64_t>(static_cast<int64_t>(ku_load<kt_int32_t>(slot(*p)))));
+            break;
+        case KU_OP_UINT32_IN_RANGE:
+            truth = in_range(ku_load<kt_uint32_t>(slot(*p)));
+            break;
+        case KU_OP_INT64_IN_RANGE:
+        case KU_OP_UINT64_IN_RANGE:
+            truth = in_range(ku_load<kt_uint64_t>(slot(*p)));
+            break;
+        case KU_OP_FLOAT32_IS:
+            truth = (ku_compare_floats(static_cast<double>(ku_load<kt_float32_t>(slot(*p))),
+                                       p_constants[p->constant].floating) &
+                     p->detail) != 0;
+            break;
+        case KU_OP_FLOAT64_IS:
+            truth = (ku_compare_floats(ku_load<kt_float64_t>(slot(*p)), p_constants[p->constant].floating) &
+                     p->detail) != 0;
+            break;
+        case KU_OP_STRING_IS:
+        case KU_OP_STRING_STARTS_WITH:
+        case KU_OP_STRING_ENDS_WITH:
+        case KU_OP_STRING_CONTAINS: {
+            const auto &  literal = p_constants[p->constant].text;
+            column_string c       = {{}, program.texts() + literal.offset, literal.length};
+            if (!ku_read_item(slot(*p), the_row.indirect, &c.item) || !ku_item_is_terminated(c.item))
+                return KU_EXPR_E_DAMAGED_VALUE;
+            truth = test_string(*p, c);
+            break;
+        }
+
+        case KU_OP_COMPARE_INTEGERS:
+            p_top -= 2;
+            truth = (ku_compare_ints(p_top[1].integer, p_top[2].integer) & p->detail) != 0;
+            break;
+        case KU_OP_COMPARE_FLOATINGS:
+            p_top -= 2;
+            truth = (ku_compare_floats(p_top[1].floating, p_top[2].floating) & p->detail) != 0;
+            break;
+        case KU_OP_COMPARE_INTEGER_WITH_FLOATING:
+            p_top -= 2;
+            truth = (ku_compare_int_with_float(p_top[1].integer, p_top[2].floating) & p->detail) != 0;
+            break;
+        case KU_OP_COMPARE_FLOATING_WITH_INTEGER:
+            p_top -= 2;
+            truth = (ku_compare_float_with_int(p_top[1].floating, p_top[2].integer) & p->detail) != 0;
+            break;
+        case KU_OP_COMPARE_STRINGS:
+            p_top -= 2;
+            truth = (compare_strings(p_top[1], p_top[2]) & p->detail) != 0;
+            break;
+        case KU_OP_EQUAL_BYTES:
+            p_top -= 2;
+            truth = bytes_are_equal(p_top[1], p_top[2]);
+            break;
+        case KU_OP_LIKE:
+            p_top -= 2;
+            truth = ku_like_matches(text_of(p_top[1]), text_of(p_top[2]));
+            break;
+        case KU_OP_MATCHES:
+            p_top--;
+            truth = ku_regex_is_found(*reinterpret_cast<const ku_regex_program_t *>(program.texts() + p->operand),
+                                      text_of(p_top[1]));
+            break;
+        case KU_OP_INTEGER_IS_TRUE:
+            truth = (p_top--)->integer != 0;
+            break;
+        case KU_OP_FLOATING_IS_TRUE:
+            truth = (p_top--)->floating != 0.0;
+            break;
+        case KU_OP_VALUE_IN_ARRAY:
+            p_top -= 2;
+            if (const kt_int32_t rc = find_in_array(*p, p_top[1], p_top[2], &truth); rc != 0)
+                return rc;
+            break;
+        case KU_OP_ARRAY_HAS_VALUE:
+            p_top -= 2;
+            if (const kt_int32_t rc = find_in_array(*p, p_top[2], p_top[1], &truth); rc != 0)
+                return rc;
+            break;
+        default:
+            __builtin_unreachable();
+        }
+
+        // A test has found its truth value.
+        const unsigned value = static_cast<unsigned>(truth) ^ p->negated;
+        if (p->after == KU_AFTER_PUSH) {
+            (++p_top)->integer = value;
+        } else if (value == static_cast<unsigned>(p->after == KU_AFTER_JUMP_IF_TRUE)) {
+            (++p_top)->integer = value;
+            p                  = p_instructions + p->target - 1;
+        }
+    }
+}
+
+} // namespace
+
+kt_int32_t ku_expr_run(const ku_program_t & program, const uint8_t * p_values, kt_uint32_t * p_result,
+                       const uint8_t * p_indirect_data, kt_uint32_t indirect_length)
+{
+    const row the_row = {p_values, {p_indirect_data, indirect_length}};
+    if (program.stack_needed <= usual_stack)
+        return run<usual_stack>(program, the_row, p_result);
+    return run<ku_expr_deepest_stack>(program, the_row, p_result);
+}
