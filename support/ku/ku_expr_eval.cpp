@@ -183,8 +183,8 @@ template <kt_uint32_t Room>
     const ku_constant_t * const    p_constants    = program.constants();
     const ku_instruction_t * const p_instructions = program.instructions();
     const ku_instruction_t *       p              = p_instructions;
-    ku_value_t                     stack[Room + 1];
-    ku_value_t *                   p_top = stack; // the topmost value; the lowest one stands at stack[1]
+    ku_value_t                     stack[Room + 1]; // the lowest value stands at 1
+    size_t                         top   = 0;
     bool                           truth = false;
 
     const auto slot = [&the_row](const ku_instruction_t & i) {
@@ -198,64 +198,64 @@ template <kt_uint32_t Room>
     for (;; p++) {
         switch (p->operation) {
         case KU_OP_END:
-            *p_result = p_top->integer != 0 ? 1 : 0;
+            *p_result = stack[top].integer != 0 ? 1 : 0;
             return 0;
 
         case KU_OP_INTEGER:
-            (++p_top)->integer = p_constants[p->constant].integer;
+            stack[++top].integer = p_constants[p->constant].integer;
             continue;
         case KU_OP_FLOATING:
-            (++p_top)->floating = p_constants[p->constant].floating;
+            stack[++top].floating = p_constants[p->constant].floating;
             continue;
         case KU_OP_TEXT: {
-            const auto & text = p_constants[p->constant].text;
-            (++p_top)->bytes  = {program.texts() + text.offset, text.length, KU_LETTERS_AS_THEY_ARE};
+            const auto & text  = p_constants[p->constant].text;
+            stack[++top].bytes = {program.texts() + text.offset, text.length, KU_LETTERS_AS_THEY_ARE};
             continue;
         }
         case KU_OP_COLUMN:
-            if (!ku_read_value(p->detail, slot(*p), the_row.indirect, ++p_top))
+            if (!ku_read_value(p->detail, slot(*p), the_row.indirect, &stack[++top]))
                 return KU_EXPR_E_DAMAGED_VALUE;
             continue;
         case KU_OP_FIELD:
-            if (const kt_int32_t rc = take_field(*p, p_top); rc != 0)
+            if (const kt_int32_t rc = take_field(*p, &stack[top]); rc != 0)
                 return rc;
             continue;
         case KU_OP_ELEMENT: {
-            const ku_int_t index = (p_top--)->integer;
-            if (const kt_int32_t rc = take_element(*p, index, p_top); rc != 0)
+            const ku_int_t index = stack[top--].integer;
+            if (const kt_int32_t rc = take_element(*p, index, &stack[top]); rc != 0)
                 return rc;
             continue;
         }
         case KU_OP_COUNT:
-            p_top->integer = ku_element_count(*p_top);
+            stack[top].integer = ku_element_count(stack[top]);
             continue;
         case KU_OP_LENGTH:
-            p_top->integer = p_top->bytes.length;
+            stack[top].integer = stack[top].bytes.length;
             continue;
         case KU_OP_LETTERS:
-            p_top->bytes.letters = p->detail;
+            stack[top].bytes.letters = p->detail;
             continue;
 
         case KU_OP_TO_FLOATING:
-            p_top->floating = static_cast<double>(p_top->integer);
+            stack[top].floating = static_cast<double>(stack[top].integer);
             continue;
         case KU_OP_SECOND_TO_FLOATING:
-            p_top[-1].floating = static_cast<double>(p_top[-1].integer);
+            stack[top - 1].floating = static_cast<double>(stack[top - 1].integer);
             continue;
         case KU_OP_NEGATE_INTEGER:
-            if (!ku_int_subtract(0, p_top->integer, &p_top->integer))
+            if (!ku_int_subtract(0, stack[top].integer, &stack[top].integer))
                 return KU_EXPR_E_INTEGER_FAULT;
             continue;
         case KU_OP_NEGATE_FLOATING:
-            p_top->floating = -p_top->floating;
+            stack[top].floating = -stack[top].floating;
             continue;
         case KU_OP_COMPLEMENT:
-            p_top->integer = ku_int_complement(p_top->integer, p->detail);
+            stack[top].integer = ku_int_complement(stack[top].integer, p->detail);
             continue;
 #define KU_INTEGER_OPERATION(operation, function)                                                                      \
     case operation:                                                                                                    \
-        p_top--;                                                                                                       \
-        if (!function(p_top->integer, p_top[1].integer, &p_top->integer))                                              \
+        top--;                                                                                                         \
+        if (!function(stack[top].integer, stack[top + 1].integer, &stack[top].integer))                                \
             return KU_EXPR_E_INTEGER_FAULT;                                                                            \
         continue;
             KU_INTEGER_OPERATION(KU_OP_ADD_INTEGERS, ku_int_add)
@@ -268,31 +268,31 @@ template <kt_uint32_t Room>
             KU_INTEGER_OPERATION(KU_OP_OR_INTEGERS, ku_int_bits_or)
 #undef KU_INTEGER_OPERATION
         case KU_OP_ADD_FLOATINGS:
-            p_top--;
-            p_top->floating += p_top[1].floating;
+            top--;
+            stack[top].floating += stack[top + 1].floating;
             continue;
         case KU_OP_SUBTRACT_FLOATINGS:
-            p_top--;
-            p_top->floating -= p_top[1].floating;
+            top--;
+            stack[top].floating -= stack[top + 1].floating;
             continue;
         case KU_OP_MULTIPLY_FLOATINGS:
-            p_top--;
-            p_top->floating *= p_top[1].floating;
+            top--;
+            stack[top].floating *= stack[top + 1].floating;
             continue;
         case KU_OP_DIVIDE_FLOATINGS:
-            p_top--;
-            p_top->floating /= p_top[1].floating;
+            top--;
+            stack[top].floating /= stack[top + 1].floating;
             continue;
 
         case KU_OP_LIST_ELEMENT:
-            p_top--;
-            if (are_equal(p->detail, *p_top, p_top[1])) {
-                p_top->integer = 1 ^ p->negated;
-                p              = p_instructions + p->target - 1;
+            top--;
+            if (are_equal(p->detail, stack[top], stack[top + 1])) {
+                stack[top].integer = 1 ^ p->negated;
+                p                  = p_instructions + p->target - 1;
             }
             continue;
         case KU_OP_LIST_END:
-            p_top->integer = p->negated;
+            stack[top].integer = p->negated;
             continue;
 
         case KU_OP_INT32_IN_RANGE:
@@ -327,52 +327,52 @@ template <kt_uint32_t Room>
         }
 
         case KU_OP_COMPARE_INTEGERS:
-            p_top -= 2;
-            truth = (ku_compare_ints(p_top[1].integer, p_top[2].integer) & p->detail) != 0;
+            top -= 2;
+            truth = (ku_compare_ints(stack[top + 1].integer, stack[top + 2].integer) & p->detail) != 0;
             break;
         case KU_OP_COMPARE_FLOATINGS:
-            p_top -= 2;
-            truth = (ku_compare_floats(p_top[1].floating, p_top[2].floating) & p->detail) != 0;
+            top -= 2;
+            truth = (ku_compare_floats(stack[top + 1].floating, stack[top + 2].floating) & p->detail) != 0;
             break;
         case KU_OP_COMPARE_INTEGER_WITH_FLOATING:
-            p_top -= 2;
-            truth = (ku_compare_int_with_float(p_top[1].integer, p_top[2].floating) & p->detail) != 0;
+            top -= 2;
+            truth = (ku_compare_int_with_float(stack[top + 1].integer, stack[top + 2].floating) & p->detail) != 0;
             break;
         case KU_OP_COMPARE_FLOATING_WITH_INTEGER:
-            p_top -= 2;
-            truth = (ku_compare_float_with_int(p_top[1].floating, p_top[2].integer) & p->detail) != 0;
+            top -= 2;
+            truth = (ku_compare_float_with_int(stack[top + 1].floating, stack[top + 2].integer) & p->detail) != 0;
             break;
         case KU_OP_COMPARE_STRINGS:
-            p_top -= 2;
-            truth = (compare_strings(p_top[1], p_top[2]) & p->detail) != 0;
+            top -= 2;
+            truth = (compare_strings(stack[top + 1], stack[top + 2]) & p->detail) != 0;
             break;
         case KU_OP_EQUAL_BYTES:
-            p_top -= 2;
-            truth = bytes_are_equal(p_top[1], p_top[2]);
+            top -= 2;
+            truth = bytes_are_equal(stack[top + 1], stack[top + 2]);
             break;
         case KU_OP_LIKE:
-            p_top -= 2;
-            truth = ku_like_matches(text_of(p_top[1]), text_of(p_top[2]));
+            top -= 2;
+            truth = ku_like_matches(text_of(stack[top + 1]), text_of(stack[top + 2]));
             break;
         case KU_OP_MATCHES:
-            p_top--;
+            top--;
             truth = ku_regex_is_found(*reinterpret_cast<const ku_regex_program_t *>(program.texts() + p->operand),
-                                      text_of(p_top[1]));
+                                      text_of(stack[top + 1]));
             break;
         case KU_OP_INTEGER_IS_TRUE:
-            truth = (p_top--)->integer != 0;
+            truth = stack[top--].integer != 0;
             break;
         case KU_OP_FLOATING_IS_TRUE:
-            truth = (p_top--)->floating != 0.0;
+            truth = stack[top--].floating != 0.0;
             break;
         case KU_OP_VALUE_IN_ARRAY:
-            p_top -= 2;
-            if (const kt_int32_t rc = find_in_array(*p, p_top[1], p_top[2], &truth); rc != 0)
+            top -= 2;
+            if (const kt_int32_t rc = find_in_array(*p, stack[top + 1], stack[top + 2], &truth); rc != 0)
                 return rc;
             break;
         case KU_OP_ARRAY_HAS_VALUE:
-            p_top -= 2;
-            if (const kt_int32_t rc = find_in_array(*p, p_top[2], p_top[1], &truth); rc != 0)
+            top -= 2;
+            if (const kt_int32_t rc = find_in_array(*p, stack[top + 2], stack[top + 1], &truth); rc != 0)
                 return rc;
             break;
         default:
@@ -382,10 +382,10 @@ template <kt_uint32_t Room>
         // A test has found its truth value.
         const unsigned value = static_cast<unsigned>(truth) ^ p->negated;
         if (p->after == KU_AFTER_PUSH) {
-            (++p_top)->integer = value;
+            stack[++top].integer = value;
         } else if (value == static_cast<unsigned>(p->after == KU_AFTER_JUMP_IF_TRUE)) {
-            (++p_top)->integer = value;
-            p                  = p_instructions + p->target - 1;
+            stack[++top].integer = value;
+            p                    = p_instructions + p->target - 1;
         }
     }
 }

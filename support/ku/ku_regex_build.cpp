@@ -18,6 +18,7 @@ namespace
 constexpr uint32_t beyond_characters  = 0x110000;
 constexpr uint32_t first_beyond_ascii = 0x80;
 constexpr size_t   least_work         = 8192; // for clearing the scratch memory and for the program's head
+constexpr size_t   node_work          = 64;   // for making an instruction, or finding that there is none to make
 
 class builder
 {
@@ -186,7 +187,7 @@ class builder
 
     [[nodiscard]] kt_int32_t make_node(uint32_t index, uint16_t next, uint16_t * p_start)
     {
-        if (!spend(1))
+        if (!spend(node_work))
             return refuse_size();
         const ku_regex_node_t & node = tree_.nodes[index];
         switch (node.kind) {
