@@ -251,7 +251,9 @@ kt_int32_t rg_create_hashed_key_table_1(rg_opaque_handle_t tree_handle, kt_char_
  *   - a writer that joins writers must ask for the same control;
  *   - a writer that joins readers of a table with a file makes everybody a writer: the file is read afresh into the
  *     shared object, without its hash table unless rg_open_hashed_key_table_1 brings one, and row indices are assigned
- *     anew. The application's data stays what the object had;
+ *     anew. The application's data stays what the object had, and so does the place that the next apply writes to:
+ *     if another process has committed since the table was first opened, an update overwrites what it committed. Who
+ *     can't rule that out closes the readers' handles first;
  *   - who opens a transient table that nobody has open decides alone.
  *
  *   mode  RG_MODE_READ, or RG_MODE_WRITE with or without RG_MODE_EXPLICIT_CONTROL; RG_MODE_READ beside
