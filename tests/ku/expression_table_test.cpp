@@ -650,8 +650,9 @@ TEST(selection, like)
                            {"path like \"%\\_of%\"", yes},
                            {"path like \"%\\\\it\"", yes},
                            {"path like $\"%\\\\\\\\it\"", yes},
-                           {"path like \"%\\it\"", yes}, // \\i is the letter i
-                           {"name like \"\\H%\"", yes} {"path like \"/usr\\/lib%\"", yes},
+                           {"path like \"%\\it\"", yes}, // a backslash takes the next character as it is
+                           {"name like \"\\H%\"", yes},
+                           {"path like \"/usr\\/lib%\"", yes},
                            {"path like \"%it\\\"", no},
                            {"utf like \"na_ve%\"", yes},
                            {"utf like \"na__ve%\"", no},
