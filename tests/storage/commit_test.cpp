@@ -269,6 +269,18 @@ TEST_F(a_commit_that_fails, in_the_sync_is_taken_back_and_returns_0)
     }
 }
 
+TEST_F(a_commit_that_fails, in_the_sync_has_shown_readers_the_new_state_before_it_is_taken_back)
+{
+    // Why the outcome of a failed sync is unknown: readers saw it, and the disk may have either.
+    rg_opaque_handle_t table = applied(r);
+    moment             sync;
+    before_call(call::fsync, 1, [&] { sync.take(r); });
+    fail_call(call::fsync, 1, EIO);
+    EXPECT_EQ(rg_commit_1(table), 0);
+    EXPECT_EQ(sync.state(), after);
+    EXPECT_EQ(state_in(r.dir.path()), before);
+}
+
 TEST_F(a_commit_that_fails, in_the_sync_and_in_the_second_sync_still_returns_0)
 {
     rg_opaque_handle_t table = applied(r);
