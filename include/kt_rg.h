@@ -543,6 +543,43 @@ kt_int32_t rg_set_application_metadata_1(rg_opaque_handle_t table_handle, kt_bin
  * Thread-safe: any number of readers run together, in a forked child too. See docs/ARCHITECTURE.md. */
 kt_int32_t rg_get_application_metadata_1(rg_opaque_handle_t table_handle, kt_binary_t ** p_p_binary);
 
+/* ---- Whole tables ---------------------------------------------------------------------------------------------- */
+
+/* Deletes a table: takes it out of the tree, and a table with a file off the disk, with its rewrite file if there is
+ * one. A table that is open lives on outside the tree until its handles are closed: they go on working, in memory and
+ * on the removed file, and a new table of that name has nothing to do with it. The same holds for other processes that
+ * have the table open: no file lock is taken.
+ *
+ *   p_registry_path  1 to 255 letters, digits, '_' and '/'
+ *
+ * Returns 0 or:
+ *   RG_E_INVALID_HANDLE  tree_handle is NULL
+ *   RG_E_INVALID_PATH    the path can't be one
+ *   RG_E_NO_SUCH_TABLE   no such table in the tree, or no file at a path under a mount point
+ *   RG_E_ACCESS, RG_E_SYSTEM_CALL ("unlink")  the file can't be removed. The table has left the tree all the same, and
+ *                        can be opened anew from its file
+ *   RG_E_NO_MEMORY       no memory for the file's path; nothing changed
+ *   RG_E_SYSTEM_CALL     the tree's lock fails; nothing changed
+ *   RG_E_INTERNAL        in a forked child, without an error record
+ * Thread-safe; the updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
+kt_int32_t rg_delete_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path);
+
+/* Removes the stray rewrite files that a crash can leave beside tables with files. No table is looked into, and none
+ * needs to exist. A rewrite that is under way, in any process, loses its file by this and fails when it would be
+ * renamed: call it when nobody writes.
+ *
+ *   p_table_names  array_count registry paths, handled in order; those under no mount point are passed over
+ *   array_count    0 is a success, whatever p_table_names is
+ *
+ * Returns 0, also where there is no such file or it can't be removed, or:
+ *   RG_E_INVALID_HANDLE  tree_handle is NULL
+ *   RG_E_NULL_POINTER    p_table_names is NULL
+ *   RG_E_INVALID_PATH    a name can't be a path: those ahead of it are done, and those behind aren't looked at
+ *   RG_E_NO_MEMORY       no memory for a path; likewise
+ *   RG_E_SYSTEM_CALL     the tree's lock fails
+ * Thread-safe. Also in a forked child. See docs/ARCHITECTURE.md. */
+kt_int32_t rg_repair_tables_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t * p_table_names, kt_uint32_t array_count);
+
 /* ---- Packed tables ---------------------------------------------------------------------------------------------
  *
  * One contiguous buffer with any number of tables: names, columns and rows. It may be sent to another process by

@@ -101,6 +101,7 @@ struct rg_i_table_struct_t {
     rg_i_read_write_lock_t        lock;
     rg_i_record_buffer_pool_t     record_buffer_pool;
     struct iovec                  io_vector[RG_I_IO_VECTOR_ELEMENTS]; // scratch for gathering writes
+    kt_uint32_t phantom_references; // of references, those that no handle stands for; guarded by the tree's lock
 };
 using rg_i_table_t = rg_i_table_struct_t;
 

@@ -35,7 +35,7 @@ void close_named(rg_i_tree_t & tree, rg_i_table_t * p_table)
 {
     if (p_table->references > 0)
         --p_table->references;
-    if (p_table->references > 0)
+    if (p_table->references > p_table->phantom_references)
         return;
 
     const bool in_tree = is_in_tree(tree, p_table);

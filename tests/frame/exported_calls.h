@@ -46,6 +46,7 @@ inline const std::vector<exported_call> & all_calls()
              return rg_create_hashed_key_table_1(h, path, &key, 1, 2, 8, hash_uint32, compare_uint32, &result);
          }},
         {"rg_delete_row_by_index_1", 29, true, [](handle_t h) { return rg_delete_row_by_index_1(h, 0); }},
+        {"rg_delete_table_1", 33, true, [](handle_t h) { return rg_delete_table_1(h, path); }},
         {"rg_get_application_metadata_1", 39, false,
          [](handle_t h) { return rg_get_application_metadata_1(h, &p_binary); }},
         {"rg_get_field_by_fixed_index_and_visibility_1", 43, false,
@@ -71,6 +72,7 @@ inline const std::vector<exported_call> & all_calls()
         {"rg_open_hashed_key_table_1", 79, false,
          [](handle_t h) { return rg_open_hashed_key_table_1(h, path, 2, 8, hash_uint32, compare_uint32, &result); }},
         {"rg_open_tree_1", 81, false, [](handle_t h) { return rg_open_tree_1(static_cast<handle_t *>(h), 0, 0); }},
+        {"rg_repair_tables_1", 87, false, [](handle_t h) { return rg_repair_tables_1(h, &path, 1); }},
         {"rg_set_application_metadata_1", 91, true,
          [](handle_t h) { return rg_set_application_metadata_1(h, &binary); }},
         {"rg_set_field_by_fixed_index_1", 93, true,
