@@ -616,6 +616,83 @@ kt_int32_t rg_pack_tables_1(kt_uint32_t total_tables, rg_opaque_handle_t * p_tab
                             kt_uint32_t * p_uncommitted_updates_visible, kt_uint32_t * p_total_row_fixed_indices,
                             kt_uint32_t * p_row_fixed_indices, void ** p_p_buffer);
 
+/* Converts a buffer in place to this machine's byte order. That comes before anything else is done with a buffer that
+ * may come from another machine; on a buffer of this machine's order it changes nothing.
+ *
+ *   p_buffer                  the buffer, at any address, as long as its header tells
+ *   header_already_converted  non-zero: the caller has put kt_pmsg_length into local order, having had to read it, and
+ *                             do_conversion is the verdict. 0: the header is as it was received, and tells the verdict
+ *   do_conversion             non-zero: the rest has to be converted. Not looked at otherwise
+ *
+ * Returns 0 or:
+ *   RG_E_NULL_POINTER  p_buffer is NULL
+ *   RG_E_LIBRARY_CALL  the header is none ("kt_pmsg_cnv_required"), or the buffer is damaged: an anchor, a count or a
+ *                      length leaves what it lies in, items overlap, or a type is none. Also if no memory is left for
+ *                      a look at the metadata. The error record has the value library's code
+ * A conversion that fails has changed part of the buffer, which is good for nothing then. A second conversion by the
+ * header's word does nothing. A buffer in which a row was chosen so often that it holds more rows than the table had is
+ * converted up to that number of rows only. Takes no lock: the buffer belongs to the caller. See
+ * docs/PACKED-FORMAT.md, docs/BAD-INPUT.md. */
+kt_int32_t rg_convert_packed_table_buffer_1(void * p_buffer, kt_uint32_t header_already_converted,
+                                            kt_int32_t do_conversion);
+
+/* Tells how many tables a buffer holds.
+ *
+ *   p_buffer               a buffer in local order; looked at up to the length in its header
+ *   p_total_packed_tables  receives the number; untouched after a failure
+ *
+ * Returns 0; RG_E_NULL_POINTER if an argument is NULL; RG_E_LIBRARY_CALL if the buffer is too short for what it tells.
+ * Takes no lock: the buffer belongs to the caller. See docs/PACKED-FORMAT.md. */
+kt_int32_t rg_get_total_packed_tables_1(void * p_buffer, kt_uint32_t * p_total_packed_tables);
+
+/* Tells a table's name on the sender: its registry path, or the path of its file if it had one. That isn't the name
+ * that unpacking gives it, which is always the registry path.
+ *
+ *   p_buffer      as above
+ *   table_index   from 0
+ *   p_table_name  receives a pointer into the buffer, good as long as that is; untouched after a failure
+ *
+ * Returns 0; RG_E_NULL_POINTER; RG_E_LIBRARY_CALL if the buffer is too short for what it tells, or the name leaves it;
+ * RG_E_NO_SUCH_INDEX. Index 0xFFFFFFFF is no wrong index but leads to the words ahead of the tables, and mostly to the
+ * first name. Takes no lock. See docs/PACKED-FORMAT.md, docs/BAD-INPUT.md. */
+kt_int32_t rg_get_packed_table_name_1(void * p_buffer, kt_uint32_t table_index, kt_char_ptr_t * p_table_name);
+
+/* Makes one table of a buffer a table of a tree, under its registry path on the sender. The table is transient and
+ * read-only: every call that needs a table open for writing is refused with RG_E_ACCESS, opening it for writing too.
+ * All its rows are committed. The sender's change counter and the application's own binary don't travel.
+ *
+ *   p_buffer            a buffer in local order; looked at up to the length in its header. The table keeps nothing of
+ *                       it: the buffer may go when the call returns
+ *   total_hash_buckets  0: no hash table, but for a table keyed by resource handle, which always gets one; without one
+ *                       the check of an RG_PRIMARY_KEY makes the call take time in proportion to the square of the rows
+ *   hash_function       of the key's stored form, as for rg_create_hashed_key_table_1; not looked at without buckets.
+ *                       NULL: the built-in rule, for a key that is a resource handle
+ *   compare_function    likewise
+ *   tree_handle         the tree; its write lock is held while the table is made
+ *   table_index         from 0
+ *   p_table             receives the handle, for rg_close_table_1; untouched after a failure
+ *
+ * Returns 0 or, with nothing made:
+ *   RG_E_NULL_POINTER    p_buffer or p_table is NULL, or a function is missing for hashing the key
+ *   RG_E_NO_SUCH_INDEX   the buffer has no such table
+ *   RG_E_LIBRARY_CALL    the buffer is damaged, or holds something else at the place of a table's parts, or no memory
+ *                        is left for a part. The error record has the value library's code
+ *   RG_E_INVALID_HANDLE  tree_handle is NULL
+ *   RG_E_INVALID_PATH    the table's path is none; a table without a name has the empty path
+ *   RG_E_TABLE_EXISTS    the tree has a table of that name
+ *   RG_E_INTERNAL        the path lies under a mount point, without an error record; or the hash function gave no
+ *                        bucket
+ *   RG_E_NO_COLUMNS, RG_E_INVALID_COLUMN, RG_E_DUPLICATE_COLUMN, RG_E_KEY_EXPECTED
+ *                        the columns are refused as by rg_create_table_1
+ *   RG_E_DUPLICATE_KEY   two rows have one key, or there is more than one key column
+ *   RG_E_NO_MEMORY       no memory
+ *   RG_E_SYSTEM_CALL     the tree's lock fails
+ * Thread-safe; also in a forked child. A value inside a row is only looked at when it is read, and then a damaged one
+ * gives RG_E_LIBRARY_CALL. See docs/PACKED-FORMAT.md, docs/BAD-INPUT.md. */
+kt_int32_t rg_unpack_table_1(void * p_buffer, kt_uint32_t total_hash_buckets, rg_hash_function_t * hash_function,
+                             rg_hash_keys_compare_function_t * compare_function, rg_opaque_handle_t tree_handle,
+                             kt_uint32_t table_index, rg_opaque_handle_t * p_table);
+
 #pragma GCC visibility pop
 #ifdef __cplusplus
 }

@@ -199,18 +199,23 @@ void rg_i_dup_nonscalar_value(kt_data_type_t type, kt_value_t * p_from_value, kt
 
 // ---- Making and destroying table objects (table/rg_i_create_table, table/rg_i_close_table; the tree's write lock) --
 //
-// Whoever is passed a hash table, here and in the storage section, owns it from the start: when the call returns a table
-// has it, or it has been closed, whatever the code. NULL: none.
+// Whoever is passed a hash table, here and in the storage section, owns it from the start: when the call returns a
+// table has it, or it has been closed, whatever the code. NULL: none.
 
-[[nodiscard]] kt_int32_t  rg_i_create_null_table(rg_i_table_t ** p_table);
-[[nodiscard]] kt_int32_t  rg_i_create_transient_table_common(rg_i_tree_t * p_tree, kt_char_ptr_t p_name,
-                                                             rg_column_t * p_columns, kt_uint32_t total_columns,
-                                                             kt_int32_t mode, rg_hash_table_t * p_rows_hash_table,
-                                                             rg_i_table_t ** p_table);
-[[nodiscard]] kt_int32_t  rg_i_create_transient_table(rg_i_tree_t * p_tree, kt_char_ptr_t p_name,
-                                                      rg_column_t * p_columns, kt_uint32_t total_columns,
-                                                      kt_int32_t mode, rg_hash_table_t * p_rows_hash_table,
-                                                      rg_i_table_t ** p_table);
+[[nodiscard]] kt_int32_t rg_i_create_null_table(rg_i_table_t ** p_table);
+[[nodiscard]] kt_int32_t rg_i_create_transient_table_common(rg_i_tree_t * p_tree, kt_char_ptr_t p_name,
+                                                            rg_column_t * p_columns, kt_uint32_t total_columns,
+                                                            kt_int32_t mode, rg_hash_table_t * p_rows_hash_table,
+                                                            rg_i_table_t ** p_table);
+[[nodiscard]] kt_int32_t rg_i_create_transient_table(rg_i_tree_t * p_tree, kt_char_ptr_t p_name,
+                                                     rg_column_t * p_columns, kt_uint32_t total_columns,
+                                                     kt_int32_t mode, rg_hash_table_t * p_rows_hash_table,
+                                                     rg_i_table_t ** p_table);
+// A table whose rows are the binaries of an array made from a packed buffer. On success the array is the table's. On a
+// failure it stays the caller's, unlike the hash table.
+[[nodiscard]] kt_int32_t rg_i_create_read_only_transient_table_from_packed_rows(
+    rg_i_tree_t * p_tree, kt_char_ptr_t p_name, rg_column_t * p_columns, kt_uint32_t total_columns,
+    rg_hash_table_t * p_rows_hash_table, kt_array_ptr_t p_packed_rows_array, rg_i_table_t ** p_table);
 [[nodiscard]] kt_uint32_t rg_i_valid_column_name(kt_char_ptr_t column_name);
 [[nodiscard]] kt_int32_t  rg_i_pack_variable_length_default_values(rg_column_t * p_columns, kt_uint32_t total_columns,
                                                                    kt_char_ptr_t * p_default_value_indirect_data,

@@ -6,6 +6,7 @@
 // docs/PACKED-FORMAT.md.
 #pragma once
 
+#include "protocol/rg_i_packed_format.h"
 #include "rg_i_table.h"
 
 // ---- Presenting a table (rg_i_packed_metadata, rg_i_packed_row_arrays; read lock) -----------------------------------
@@ -33,6 +34,13 @@
                                                                  kt_array_ptr_t * p_row_array);
 // NULL is accepted, and an array whose later elements aren't made yet.
 void rg_i_free_packed_table_column_metadata_array(kt_array_ptr_t pColDefsArray);
+
+// ---- Looking into a buffer (rg_x_get_packed_tables) ----------------------------------------------------------------
+
+// RG_E_NULL_POINTER, or RG_E_LIBRARY_CALL for a length that is below the fixed part.
+[[nodiscard]] kt_int32_t rg_i_open_packed_buffer(void * p_buffer, rg_i_packed_buffer_t * p_look);
+// RG_E_NO_SUCH_INDEX, which 0xFFFFFFFF never gets.
+[[nodiscard]] kt_int32_t rg_i_check_packed_table_index(const rg_i_packed_buffer_t & buffer, kt_uint32_t table_index);
 
 // ---- Making a table of them (rg_x_unpack_table) --------------------------------------------------------------------
 

@@ -34,6 +34,9 @@ struct create_request_t {
     rg_column_t * p_columns;
     kt_uint32_t   total_columns;
     kt_int32_t    mode; // RG_MODE_WRITE with or without RG_MODE_EXPLICIT_CONTROL
+    // The rows of a table from a packed buffer, which has no others and is read-only; NULL: the table starts empty.
+    // Goes to the table when the creation succeeds.
+    kt_array_ptr_t p_packed_rows_array;
 };
 
 [[nodiscard]] kt_int32_t create_with_file(const create_request_t & request, owned_hash_table & hash_table,
@@ -48,24 +51,33 @@ struct create_request_t {
                                         hash_table.release(), p_p_table);
 }
 
+[[nodiscard]] kt_int32_t create_in_memory(const create_request_t & request, owned_hash_table & hash_table,
+                                          rg_i_table_t ** p_p_table)
+{
+    if (request.p_packed_rows_array != nullptr)
+        return rg_i_create_read_only_transient_table_from_packed_rows(
+            request.p_tree, request.p_table_name, request.p_columns, request.total_columns, hash_table.release(),
+            request.p_packed_rows_array, p_p_table);
+    return rg_i_create_transient_table(request.p_tree, request.p_table_name, request.p_columns, request.total_columns,
+                                       request.mode, hash_table.release(), p_p_table);
+}
+
 [[nodiscard]] kt_int32_t create_resolved(const create_request_t & request, owned_hash_table & hash_table,
-                                         const kt_array_t * p_packed_rows_array, rg_opaque_handle_t * p_result)
+                                         rg_opaque_handle_t * p_result)
 {
     if (tfind(request.p_table_name, &request.p_tree->p_tables, rg_i_string_to_table_compare) != nullptr)
         return rg_i_fail(RG_HERE, RG_E_TABLE_EXISTS);
-    if (request.block_size != 0 && p_packed_rows_array != nullptr)
+    if (request.block_size != 0 && request.p_packed_rows_array != nullptr)
         return RG_E_INTERNAL; // without a record: packed rows make transient tables only
 
     rg_i_table_t * p_table = nullptr;
-    if (const kt_int32_t rc =
-            request.block_size != 0
-                ? create_with_file(request, hash_table, &p_table)
-                : rg_i_create_transient_table(request.p_tree, request.p_table_name, request.p_columns,
-                                              request.total_columns, request.mode, hash_table.release(), &p_table);
+    if (const kt_int32_t rc = request.block_size != 0 ? create_with_file(request, hash_table, &p_table)
+                                                      : create_in_memory(request, hash_table, &p_table);
         rc != 0)
         return rc;
     if (tsearch(p_table, &request.p_tree->p_tables, rg_i_table_compare) == nullptr) {
-        rg_i_close_table(p_table); // a file stays, and can be opened
+        p_table->p_packed_rows_array = nullptr; // the caller's again
+        rg_i_close_table(p_table);              // a file stays, and can be opened
         return rg_i_fail_no_memory(RG_HERE);
     }
     *p_result = p_table;
@@ -92,13 +104,19 @@ kt_int32_t rg_x_create_table(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_reg
         return tree_lock.code();
 
     // Kept because callers depend on it: a creation always writes, and only the bit for explicit control counts.
-    create_request_t request{
-        p_tree, p_registry_path, nullptr, 0, p_columns, array_count, RG_MODE_WRITE | (mode & RG_MODE_EXPLICIT_CONTROL)};
+    create_request_t request{p_tree,
+                             p_registry_path,
+                             nullptr,
+                             0,
+                             p_columns,
+                             array_count,
+                             RG_MODE_WRITE | (mode & RG_MODE_EXPLICIT_CONTROL),
+                             p_packed_rows_array};
     if (const kt_int32_t rc = rg_i_resolve_path(p_tree, p_registry_path, &request.p_table_name, &request.block_size);
         rc != 0)
         return rc;
     const owned_buffer table_name(request.block_size != 0 ? request.p_table_name : nullptr);
-    return create_resolved(request, hash_table, p_packed_rows_array, p_result_table_handle);
+    return create_resolved(request, hash_table, p_result_table_handle);
 }
 
 extern "C" kt_int32_t rg_create_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path,

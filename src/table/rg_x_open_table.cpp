@@ -109,6 +109,10 @@ struct open_request_t {
     const bool        asks_to_write = (request.mode & RG_MODE_WRITE) != 0;
     const kt_uint32_t control       = implicit_control(request.mode);
 
+    // The rows of such a table don't lie in its pool, so nothing could be done with them but reading.
+    if (asks_to_write && p_table->p_packed_rows_array != nullptr)
+        return rg_i_fail(RG_HERE, RG_E_ACCESS);
+
     // Only a transient table waits in the tree with nobody on it. Its first opener decides alone.
     if (++p_table->references == 1) {
         p_table->implicitly_controlled = control;
