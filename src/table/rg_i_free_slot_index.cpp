@@ -12,9 +12,9 @@
 namespace
 {
 
-constexpr unsigned    word_shift     = 6; // 64 bits a word
-constexpr kt_uint32_t bit_mask       = 63;
-constexpr unsigned    maximum_levels = 6; // 64 to the sixth exceeds any number of slots
+constexpr unsigned word_shift     = 6; // 64 bits a word
+constexpr size_t   bit_mask       = 63;
+constexpr unsigned maximum_levels = 6; // 64 to the sixth exceeds any number of slots
 
 [[nodiscard]] size_t words_for(size_t bits)
 {
@@ -26,37 +26,29 @@ constexpr unsigned    maximum_levels = 6; // 64 to the sixth exceeds any number 
     return kt_uint64_t{1} << (position & bit_mask);
 }
 
-// Where each level starts, the slots' own level first.
-struct levels_t {
-    size_t   start[maximum_levels];
-    unsigned count;
+// One level of the set: where its words start, and how many bits it has. The slots' own level starts at 0.
+struct level_t {
+    size_t start;
+    size_t bits;
+
+    [[nodiscard]] size_t  word_at(size_t position) const { return start + (position >> word_shift); }
+    [[nodiscard]] bool    is_top() const { return bits <= bit_mask + 1; }
+    [[nodiscard]] level_t above() const { return {start + words_for(bits), words_for(bits)}; }
 };
 
-[[nodiscard]] levels_t levels_for(kt_uint32_t total_slots)
+[[nodiscard]] size_t highest_bit(kt_uint64_t word)
 {
-    levels_t levels{};
-    size_t   start = 0;
-    size_t   bits  = total_slots;
-    do {
-        assert(levels.count < maximum_levels);
-        levels.start[levels.count++] = start;
-        bits                         = words_for(bits);
-        start += bits;
-    } while (bits > 1);
-    return levels;
+    return static_cast<size_t>(std::bit_width(word)) - 1;
 }
 
 } // namespace
 
 size_t rg_i_free_slot_index_words(kt_uint32_t total_slots)
 {
-    size_t words = 0;
-    size_t bits  = total_slots;
-    do {
-        bits = words_for(bits);
-        words += bits;
-    } while (bits > 1);
-    return words;
+    level_t level{0, total_slots};
+    while (!level.is_top())
+        level = level.above();
+    return level.start + words_for(level.bits);
 }
 
 void rg_i_free_slot_index_fill(kt_uint64_t * p_words, kt_uint32_t total_slots, kt_uint32_t first_slot)
@@ -66,19 +58,16 @@ void rg_i_free_slot_index_fill(kt_uint64_t * p_words, kt_uint32_t total_slots, k
         return;
 
     // On each level the set bits reach from the first one to the end, so the next level's do too.
-    const levels_t levels = levels_for(total_slots);
-    size_t         first  = first_slot;
-    size_t         bits   = total_slots;
-    for (unsigned level = 0; level < levels.count; ++level) {
-        kt_uint64_t * p_level    = p_words + levels.start[level];
-        const size_t  first_word = first >> word_shift;
-        const size_t  words      = words_for(bits);
-        std::memset(p_level + first_word, 0xFF, (words - first_word) * sizeof *p_words);
-        p_level[first_word] &= ~(bit_of(first) - 1);
-        if ((bits & bit_mask) != 0)
-            p_level[words - 1] &= bit_of(bits) - 1;
-        first = first_word;
-        bits  = words;
+    size_t first = first_slot;
+    for (level_t level{0, total_slots};; level = level.above(), first >>= word_shift) {
+        kt_uint64_t * p_first_word = p_words + level.word_at(first);
+        kt_uint64_t * p_last_word  = p_words + level.word_at(level.bits - 1);
+        std::memset(p_first_word, 0xFF, static_cast<size_t>(p_last_word + 1 - p_first_word) * sizeof *p_words);
+        *p_first_word &= ~(bit_of(first) - 1);
+        if ((level.bits & bit_mask) != 0)
+            *p_last_word &= bit_of(level.bits) - 1;
+        if (level.is_top())
+            return;
     }
 }
 
@@ -90,50 +79,47 @@ bool rg_i_free_slot_index_contains(const kt_uint64_t * p_words, kt_uint32_t slot
 void rg_i_free_slot_index_add(kt_uint64_t * p_words, kt_uint32_t total_slots, kt_uint32_t slot)
 {
     assert(slot < total_slots);
-    const levels_t levels   = levels_for(total_slots);
-    size_t         position = slot;
-    for (unsigned level = 0; level < levels.count; ++level) {
-        kt_uint64_t &     word   = p_words[levels.start[level] + (position >> word_shift)];
+    size_t position = slot;
+    for (level_t level{0, total_slots};; level = level.above(), position >>= word_shift) {
+        kt_uint64_t &     word   = p_words[level.word_at(position)];
         const kt_uint64_t before = word;
         word |= bit_of(position);
-        if (before != 0)
-            return; // the levels above know this word
-        position >>= word_shift;
+        if (before != 0 || level.is_top())
+            return; // the levels above know of a word that isn't zero
     }
 }
 
 void rg_i_free_slot_index_remove(kt_uint64_t * p_words, kt_uint32_t total_slots, kt_uint32_t slot)
 {
     assert(slot < total_slots);
-    const levels_t levels   = levels_for(total_slots);
-    size_t         position = slot;
-    for (unsigned level = 0; level < levels.count; ++level) {
-        kt_uint64_t & word = p_words[levels.start[level] + (position >> word_shift)];
+    size_t position = slot;
+    for (level_t level{0, total_slots};; level = level.above(), position >>= word_shift) {
+        kt_uint64_t & word = p_words[level.word_at(position)];
         word &= ~bit_of(position);
-        if (word != 0)
+        if (word != 0 || level.is_top())
             return;
-        position >>= word_shift;
     }
 }
 
 kt_uint32_t rg_i_free_slot_index_below(const kt_uint64_t * p_words, kt_uint32_t total_slots, kt_uint32_t slot)
 {
-    const levels_t levels   = levels_for(total_slots);
-    size_t         position = slot;
-    for (unsigned level = 0; level < levels.count; ++level) {
-        const kt_uint64_t word = p_words[levels.start[level] + (position >> word_shift)] & (bit_of(position) - 1);
+    size_t   starts[maximum_levels];
+    unsigned climbed  = 0;
+    size_t   position = slot;
+    for (level_t level{0, total_slots};; level = level.above()) {
+        assert(climbed < maximum_levels);
+        starts[climbed]        = level.start;
+        const kt_uint64_t word = p_words[level.word_at(position)] & (bit_of(position) - 1);
         position >>= word_shift;
-        if (word == 0)
-            continue;
-
-        // Down again, always to the highest bit.
-        position = (position << word_shift) + static_cast<size_t>(std::bit_width(word)) - 1;
-        while (level-- > 0) {
-            const kt_uint64_t below = p_words[levels.start[level] + position];
-            assert(below != 0);
-            position = (position << word_shift) + static_cast<size_t>(std::bit_width(below)) - 1;
+        if (word != 0) {
+            // Down again, always to the highest bit.
+            position = (position << word_shift) + highest_bit(word);
+            while (climbed-- > 0)
+                position = (position << word_shift) + highest_bit(p_words[starts[climbed] + position]);
+            return static_cast<kt_uint32_t>(position);
         }
-        return static_cast<kt_uint32_t>(position);
+        if (level.is_top())
+            return RG_I_NO_SLOT;
+        ++climbed;
     }
-    return RG_I_NO_SLOT;
 }

@@ -36,10 +36,10 @@ void free_slots_from(rg_i_table_t * p_table, kt_uint32_t first_slot)
 {
     rg_i_index_entry_t * p_slots = p_table->p_rows_fixed_index;
     const kt_uint32_t    end     = p_table->maximum_rows;
-    std::memset(static_cast<void *>(p_slots + first_slot), 0,
-                (end - first_slot) * static_cast<size_t>(sizeof *p_slots));
-    for (kt_uint32_t slot = first_slot; slot + 1 < end; ++slot)
-        p_slots[slot].p_pending_change = p_slots + slot + 1;
+    for (kt_uint32_t slot = first_slot; slot < end; ++slot) {
+        p_slots[slot]                  = rg_i_index_entry_t{};
+        p_slots[slot].p_pending_change = slot + 1 < end ? p_slots + slot + 1 : nullptr;
+    }
     p_table->p_rows_free_chain = first_slot < end ? p_slots + first_slot : nullptr;
     rg_i_free_slot_index_fill(free_slot_index(p_table), end, first_slot);
 }
@@ -280,7 +280,7 @@ void rg_i_rows_free_chain_insert(rg_i_table_t * p_table, rg_i_index_entry_t * p_
     if (rg_i_free_slot_index_contains(p_words, slot))
         return; // a damaged file may free a row twice; the chain must not meet itself
 
-    std::memset(static_cast<void *>(p_new_entry), 0, sizeof *p_new_entry);
+    *p_new_entry            = rg_i_index_entry_t{};
     const kt_uint32_t below = rg_i_free_slot_index_below(p_words, p_table->maximum_rows, slot);
     if (below == RG_I_NO_SLOT) {
         p_new_entry->p_pending_change = p_table->p_rows_free_chain;
