@@ -76,7 +76,8 @@ void report_full(rg_i_table_t & table, kt_int32_t rc)
 
 [[nodiscard]] bool seek_old_commit_type(const rg_i_table_t & table)
 {
-    const off64_t offset = off64_t{table.disk_commit_record_offset} + offsetof(rg_i_disk_record_metadata_t, type);
+    constexpr off64_t type_offset = offsetof(rg_i_disk_record_metadata_t, type);
+    const off64_t     offset      = off64_t{table.disk_commit_record_offset} + type_offset;
     return lseek64(table.file_fd, offset, SEEK_SET) >= 0;
 }
 

@@ -110,8 +110,8 @@ struct ku_expr_trouble_t {
 };
 
 // Fills in the trouble and returns its code.
-__attribute__((format(printf, 4, 5))) [[nodiscard]] kt_int32_t
-ku_expr_refuse(ku_expr_trouble_t * p_trouble, kt_int32_t code, const char * p_at, const char * p_format, ...);
+[[nodiscard, gnu::format(printf, 4, 5)]] kt_int32_t ku_expr_refuse(ku_expr_trouble_t * p_trouble, kt_int32_t code,
+                                                                   const char * p_at, const char * p_format, ...);
 
 // Reads the token that starts at or behind p, which is followed somewhere by p_end, where a NUL stands. The text is
 // UTF-8.
