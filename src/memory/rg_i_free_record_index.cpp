@@ -14,6 +14,7 @@
 #include <cassert>
 #include <cstdint>
 #include <cstdlib>
+#include <cstring>
 
 #if defined(__SANITIZE_ADDRESS__)
 #include <sanitizer/asan_interface.h>
@@ -23,12 +24,14 @@ namespace
 {
 
 using block_t  = rg_i_block_index_t;
+using node_t   = rg_i_block_node_t;
 using index_t  = rg_i_free_record_index_t;
 using record_t = rg_i_record_metadata_t;
 
 constexpr kt_uint32_t segment_length = 1024;
 constexpr kt_uint32_t fan_out        = 16;
 constexpr kt_uint32_t nothing        = UINT32_MAX; // no such segment
+constexpr kt_uint32_t none           = 0;          // no such node
 constexpr kt_uint32_t most_levels    = 7;          // 16^6 segments are more than a block can have
 
 // Between the records and the index, so that a builder that writes past its block is caught where it does.
@@ -54,7 +57,7 @@ std::uintptr_t offset_in(const block_t * p_block, const kt_char_t * p_address)
     return reinterpret_cast<std::uintptr_t>(p_address) - reinterpret_cast<std::uintptr_t>(p_block->p_block);
 }
 
-// Whether an address that is a record's, of any block, is one of this block's. The block's own index stands directly
+// Whether an address that is a record's, of any block, is one of this block's. The block's own index stands close
 // behind its records, so that nothing needs to be read to tell.
 bool holds(const block_t * p_block, const kt_char_t * p_address)
 {
@@ -124,6 +127,15 @@ kt_uint32_t longest_in(const block_t * p_block)
     return p_block->p_longest[p_block->bounds - 1];
 }
 
+void raise_node_bounds(block_t * p_block, kt_uint32_t length)
+{
+    node_t * const p_nodes = p_block->p_index->p_nodes;
+    kt_uint32_t    n       = p_block->node;
+    p_nodes[n].longest     = std::max(p_nodes[n].longest, length);
+    for (; n != none && p_nodes[n].longest_in_subtree < length; n = p_nodes[n].parent)
+        p_nodes[n].longest_in_subtree = length;
+}
+
 void raise_bounds(block_t * p_block, kt_uint32_t segment, kt_uint32_t length)
 {
     kt_uint32_t * p_bounds = p_block->p_longest;
@@ -131,8 +143,7 @@ void raise_bounds(block_t * p_block, kt_uint32_t segment, kt_uint32_t length)
     for (kt_uint32_t i = segment; p_bounds[i] < length; i /= fan_out) {
         p_bounds[i] = length;
         if (count == 1) {
-            for (block_t * p = p_block; p != nullptr && p->longest_in_subtree < length; p = p->p_parent)
-                p->longest_in_subtree = length;
+            raise_node_bounds(p_block, length);
             return;
         }
         p_bounds += count;
@@ -243,114 +254,12 @@ rg_i_free_place_t first_fit_in(block_t * p_block, kt_uint32_t length)
     return {};
 }
 
-// ---- The tree of blocks ----
-
-kt_uint32_t subtree_bound(const block_t * p_block)
-{
-    return p_block == nullptr ? 0 : p_block->longest_in_subtree;
-}
-
-void correct_subtree_bound(block_t * p_block)
-{
-    p_block->longest_in_subtree =
-        std::max({longest_in(p_block), subtree_bound(p_block->p_left), subtree_bound(p_block->p_right)});
-}
-
-rg_i_free_place_t first_fit_below(block_t * p_block, kt_uint32_t length)
-{
-    if (subtree_bound(p_block) < length)
-        return {};
-    if (const rg_i_free_place_t place = first_fit_below(p_block->p_left, length); place.p_record != nullptr)
-        return place;
-    if (longest_in(p_block) >= length)
-        if (const rg_i_free_place_t place = first_fit_in(p_block, length); place.p_record != nullptr)
-            return place;
-    if (const rg_i_free_place_t place = first_fit_below(p_block->p_right, length); place.p_record != nullptr)
-        return place;
-    correct_subtree_bound(p_block);
-    return {};
-}
-
-kt_char_ptr_t last_free_below(block_t * p_block)
-{
-    if (subtree_bound(p_block) == 0)
-        return nullptr;
-    if (const kt_char_ptr_t p_record = last_free_below(p_block->p_right); p_record != nullptr)
-        return p_record;
-    if (const kt_char_ptr_t p_record = last_free_in(p_block); p_record != nullptr)
-        return p_record;
-    if (const kt_char_ptr_t p_record = last_free_below(p_block->p_left); p_record != nullptr)
-        return p_record;
-    correct_subtree_bound(p_block);
-    return nullptr;
-}
-
-kt_char_ptr_t last_free_in_blocks_before(block_t * p_block)
-{
-    if (const kt_char_ptr_t p_record = last_free_below(p_block->p_left); p_record != nullptr)
-        return p_record;
-    for (; p_block->p_parent != nullptr; p_block = p_block->p_parent) {
-        block_t * const p_parent = p_block->p_parent;
-        if (p_parent->p_right != p_block)
-            continue;
-        if (const kt_char_ptr_t p_record = last_free_in(p_parent); p_record != nullptr)
-            return p_record;
-        if (const kt_char_ptr_t p_record = last_free_below(p_parent->p_left); p_record != nullptr)
-            return p_record;
-    }
-    return nullptr;
-}
-
-// Scattered, so that the tree is even in whatever order the heap hands out addresses.
-kt_uint32_t priority_for(const block_t * p_block)
-{
-    kt_uint64_t mixed = reinterpret_cast<std::uintptr_t>(p_block);
-    mixed             = (mixed ^ (mixed >> 33)) * 0xff51afd7ed558ccdull;
-    mixed             = (mixed ^ (mixed >> 33)) * 0xc4ceb9fe1a85ec53ull;
-    return static_cast<kt_uint32_t>(mixed >> 32);
-}
-
-block_t ** link_to(index_t * p_index, const block_t * p_block)
-{
-    block_t * const p_parent = p_block->p_parent;
-    if (p_parent == nullptr)
-        return &p_index->p_root;
-    return p_parent->p_left == p_block ? &p_parent->p_left : &p_parent->p_right;
-}
-
-// Lets a block and its parent change places.
-void rotate_up(index_t * p_index, block_t * p_block)
-{
-    block_t * const  p_parent = p_block->p_parent;
-    block_t ** const p_link   = link_to(p_index, p_parent);
-    const bool       is_left  = p_parent->p_left == p_block;
-    block_t *&       p_inner  = is_left ? p_block->p_right : p_block->p_left;
-
-    (is_left ? p_parent->p_left : p_parent->p_right) = p_inner;
-    if (p_inner != nullptr)
-        p_inner->p_parent = p_parent;
-    p_inner            = p_parent;
-    p_block->p_parent  = p_parent->p_parent;
-    p_parent->p_parent = p_block;
-    *p_link            = p_block;
-
-    p_block->longest_in_subtree = p_parent->longest_in_subtree;
-    correct_subtree_bound(p_parent);
-}
-
-void enter_into_tree(index_t * p_index, block_t * p_block)
-{
-    block_t ** p_link = &p_index->p_root;
-    while (*p_link != nullptr) {
-        p_block->p_parent = *p_link;
-        p_link            = p_block->p_block < (*p_link)->p_block ? &(*p_link)->p_left : &(*p_link)->p_right;
-    }
-    *p_link = p_block;
-    while (p_block->p_parent != nullptr && p_block->p_parent->priority < p_block->priority)
-        rotate_up(p_index, p_block);
-}
-
 // ---- What stands behind a block ----
+
+std::size_t rounded(std::size_t size)
+{
+    return (size + 7) / 8 * 8;
+}
 
 struct layout_t {
     kt_uint32_t segments;
@@ -364,48 +273,208 @@ struct layout_t {
     {
         segments    = total_bytes / segment_length + 1;
         bounds      = count_of_bounds(segments);
-        block_index = rounded(std::size_t{total_bytes} + RG_I_RECORD_OVERHANG) + guard_length;
+        block_index = offset_of_index(total_bytes);
         longest     = block_index + sizeof(block_t);
         first       = longest + std::size_t{bounds} * sizeof(kt_uint32_t);
         root        = rounded(first + std::size_t{segments} * sizeof(kt_uint16_t));
     }
-    static std::size_t rounded(std::size_t size) { return (size + 7) / 8 * 8; }
+    static std::size_t offset_of_index(kt_uint32_t total_bytes)
+    {
+        return rounded(std::size_t{total_bytes} + RG_I_RECORD_OVERHANG) + guard_length;
+    }
 };
+
+// ---- The tree of blocks ----
+
+block_t * block_at(const node_t & node)
+{
+    return reinterpret_cast<block_t *>(node.p_start + layout_t::offset_of_index(node.total_bytes));
+}
+
+void correct_subtree_bound(node_t * p_nodes, kt_uint32_t n)
+{
+    node_t & node = p_nodes[n];
+    node.longest_in_subtree =
+        std::max({node.longest, p_nodes[node.left].longest_in_subtree, p_nodes[node.right].longest_in_subtree});
+}
+
+rg_i_free_place_t first_fit_below(node_t * p_nodes, kt_uint32_t n, kt_uint32_t length)
+{
+    node_t & node = p_nodes[n];
+    if (node.longest_in_subtree < length)
+        return {};
+    if (const rg_i_free_place_t place = first_fit_below(p_nodes, node.left, length); place.p_record != nullptr)
+        return place;
+    if (node.longest >= length) {
+        block_t * const p_block = block_at(node);
+        if (const rg_i_free_place_t place = first_fit_in(p_block, length); place.p_record != nullptr)
+            return place;
+        node.longest = longest_in(p_block);
+    }
+    if (const rg_i_free_place_t place = first_fit_below(p_nodes, node.right, length); place.p_record != nullptr)
+        return place;
+    correct_subtree_bound(p_nodes, n);
+    return {};
+}
+
+kt_char_ptr_t last_free_at(node_t & node)
+{
+    if (node.longest == 0)
+        return nullptr;
+    block_t * const     p_block  = block_at(node);
+    const kt_char_ptr_t p_record = last_free_in(p_block);
+    if (p_record == nullptr)
+        node.longest = longest_in(p_block);
+    return p_record;
+}
+
+kt_char_ptr_t last_free_below(node_t * p_nodes, kt_uint32_t n)
+{
+    node_t & node = p_nodes[n];
+    if (node.longest_in_subtree == 0)
+        return nullptr;
+    if (const kt_char_ptr_t p_record = last_free_below(p_nodes, node.right); p_record != nullptr)
+        return p_record;
+    if (const kt_char_ptr_t p_record = last_free_at(node); p_record != nullptr)
+        return p_record;
+    if (const kt_char_ptr_t p_record = last_free_below(p_nodes, node.left); p_record != nullptr)
+        return p_record;
+    correct_subtree_bound(p_nodes, n);
+    return nullptr;
+}
+
+kt_char_ptr_t last_free_in_blocks_before(const block_t * p_block)
+{
+    node_t * const p_nodes = p_block->p_index->p_nodes;
+    kt_uint32_t    n       = p_block->node;
+    if (const kt_char_ptr_t p_record = last_free_below(p_nodes, p_nodes[n].left); p_record != nullptr)
+        return p_record;
+    for (kt_uint32_t parent = p_nodes[n].parent; parent != none; n = parent, parent = p_nodes[n].parent) {
+        if (p_nodes[parent].right != n)
+            continue;
+        if (const kt_char_ptr_t p_record = last_free_at(p_nodes[parent]); p_record != nullptr)
+            return p_record;
+        if (const kt_char_ptr_t p_record = last_free_below(p_nodes, p_nodes[parent].left); p_record != nullptr)
+            return p_record;
+    }
+    return nullptr;
+}
+
+// No node stands below one with a lower priority. They are scattered, so that the tree is even in whatever order the
+// heap hands out addresses.
+kt_uint64_t priority_of(const node_t & node)
+{
+    kt_uint64_t mixed = reinterpret_cast<std::uintptr_t>(node.p_start);
+    mixed             = (mixed ^ (mixed >> 33)) * 0xff51afd7ed558ccdull;
+    mixed             = (mixed ^ (mixed >> 33)) * 0xc4ceb9fe1a85ec53ull;
+    return mixed ^ (mixed >> 33);
+}
+
+// Lets a node and its parent change places.
+void rotate_up(index_t * p_index, kt_uint32_t n)
+{
+    node_t * const    p_nodes     = p_index->p_nodes;
+    node_t &          node        = p_nodes[n];
+    const kt_uint32_t parent      = node.parent;
+    const kt_uint32_t grandparent = p_nodes[parent].parent;
+    const bool        is_left     = p_nodes[parent].left == n;
+    kt_uint32_t &     inner       = is_left ? node.right : node.left;
+
+    (is_left ? p_nodes[parent].left : p_nodes[parent].right) = inner;
+    if (inner != none)
+        p_nodes[inner].parent = parent;
+    inner                  = parent;
+    p_nodes[parent].parent = n;
+    node.parent            = grandparent;
+    if (grandparent == none)
+        p_index->root = n;
+    else
+        (p_nodes[grandparent].left == parent ? p_nodes[grandparent].left : p_nodes[grandparent].right) = n;
+
+    node.longest_in_subtree = p_nodes[parent].longest_in_subtree;
+    correct_subtree_bound(p_nodes, parent);
+}
+
+void enter_into_tree(index_t * p_index, kt_uint32_t n)
+{
+    node_t * const p_nodes = p_index->p_nodes;
+    kt_uint32_t *  p_link  = &p_index->root;
+    while (*p_link != none) {
+        p_nodes[n].parent = *p_link;
+        p_link = p_nodes[n].p_start < p_nodes[*p_link].p_start ? &p_nodes[*p_link].left : &p_nodes[*p_link].right;
+    }
+    *p_link = n;
+    while (p_nodes[n].parent != none && priority_of(p_nodes[p_nodes[n].parent]) < priority_of(p_nodes[n]))
+        rotate_up(p_index, n);
+}
+
+[[nodiscard]] bool make_room_for_a_node(index_t * p_index)
+{
+    if (p_index->node_count < p_index->node_capacity)
+        return true;
+    const std::size_t capacity = std::size_t{p_index->node_capacity} * 2;
+    auto * const      p_nodes  = static_cast<node_t *>(std::malloc(capacity * sizeof(node_t)));
+    if (p_nodes == nullptr)
+        return false;
+    std::memcpy(p_nodes, p_index->p_nodes, p_index->node_count * sizeof(node_t));
+    rg_i_drop_index(p_index);
+    p_index->p_nodes       = p_nodes;
+    p_index->node_capacity = static_cast<kt_uint32_t>(capacity);
+    return true;
+}
+
+index_t * start_index(kt_char_ptr_t p_memory)
+{
+    auto * const p_index   = reinterpret_cast<index_t *>(p_memory);
+    p_index->p_nodes       = p_index->first_nodes;
+    p_index->node_count    = 1; // the one that stands for none
+    p_index->node_capacity = RG_I_FIRST_BLOCK_NODES;
+    return p_index;
+}
 
 } // namespace
 
-rg_i_record_buffer_t * rg_i_make_indexed_block(kt_uint32_t total_bytes, bool first_of_pool)
+rg_i_block_index_t * rg_i_make_indexed_block(rg_i_free_record_index_t ** p_p_index, kt_uint32_t total_bytes)
 {
-    const layout_t    layout(total_bytes);
-    const std::size_t size    = layout.root + (first_of_pool ? sizeof(index_t) : 0);
-    auto * const      p_block = static_cast<rg_i_record_buffer_t *>(std::calloc(1, size));
-    if (p_block == nullptr)
+    const bool first_of_pool = *p_p_index == nullptr;
+    if (!first_of_pool && !make_room_for_a_node(*p_p_index))
         return nullptr;
-    p_block->total_bytes = total_bytes;
+    const layout_t layout(total_bytes);
+    auto * const   p_start =
+        static_cast<kt_char_ptr_t>(std::calloc(1, layout.root + (first_of_pool ? sizeof(index_t) : 0)));
+    if (p_start == nullptr)
+        return nullptr;
 #if defined(__SANITIZE_ADDRESS__)
     const std::size_t readable = std::size_t{total_bytes} + RG_I_RECORD_OVERHANG;
-    ASAN_POISON_MEMORY_REGION(reinterpret_cast<kt_char_ptr_t>(p_block) + readable, layout.block_index - readable);
+    ASAN_POISON_MEMORY_REGION(p_start + readable, layout.block_index - readable);
 #endif
+
+    // Nothing below fails.
+    if (first_of_pool)
+        *p_p_index = start_index(p_start + layout.root);
+    index_t * const   p_index = *p_p_index;
+    const kt_uint32_t n       = p_index->node_count++;
+    p_index->p_nodes[n]       = {p_start, total_bytes, none, none, none, 0, 0};
+
+    auto * const p_block = reinterpret_cast<block_t *>(p_start + layout.block_index);
+    p_block->p_block     = reinterpret_cast<rg_i_record_buffer_t *>(p_start);
+    p_block->p_index     = p_index;
+    p_block->p_longest   = reinterpret_cast<kt_uint32_t *>(p_start + layout.longest);
+    p_block->p_first     = reinterpret_cast<kt_uint16_t *>(p_start + layout.first);
+    p_block->segments    = layout.segments;
+    p_block->bounds      = layout.bounds;
+    p_block->clean_from  = RG_I_RECORD_BUFFER_HEAD_LENGTH;
+    p_block->node        = n;
+
+    p_block->p_block->total_bytes = total_bytes;
+    enter_into_tree(p_index, n);
     return p_block;
 }
 
-rg_i_block_index_t * rg_i_index_block(rg_i_free_record_index_t ** p_p_index, rg_i_record_buffer_t * p_block)
+void rg_i_drop_index(rg_i_free_record_index_t * p_index)
 {
-    const layout_t      layout(p_block->total_bytes);
-    const kt_char_ptr_t p_start   = reinterpret_cast<kt_char_ptr_t>(p_block);
-    auto * const        p_indexed = reinterpret_cast<block_t *>(p_start + layout.block_index);
-
-    p_indexed->p_block    = p_block;
-    p_indexed->p_longest  = reinterpret_cast<kt_uint32_t *>(p_start + layout.longest);
-    p_indexed->p_first    = reinterpret_cast<kt_uint16_t *>(p_start + layout.first);
-    p_indexed->segments   = layout.segments;
-    p_indexed->bounds     = layout.bounds;
-    p_indexed->priority   = priority_for(p_indexed);
-    p_indexed->clean_from = RG_I_RECORD_BUFFER_HEAD_LENGTH;
-    if (*p_p_index == nullptr)
-        *p_p_index = reinterpret_cast<index_t *>(p_start + layout.root);
-    enter_into_tree(*p_p_index, p_indexed);
-    return p_indexed;
+    if (p_index != nullptr && p_index->p_nodes != p_index->first_nodes)
+        std::free(p_index->p_nodes);
 }
 
 rg_i_block_index_t * rg_i_block_of(rg_i_free_record_index_t * p_index, const kt_char_t * p_address)
@@ -413,12 +482,14 @@ rg_i_block_index_t * rg_i_block_of(rg_i_free_record_index_t * p_index, const kt_
     block_t * p_block = p_index->p_recent;
     if (p_block != nullptr && holds(p_block, p_address))
         return p_block;
-    p_block = p_index->p_root;
-    while (p_block != nullptr && !holds(p_block, p_address))
-        p_block = p_address < start_of(p_block) ? p_block->p_left : p_block->p_right;
-    if (p_block != nullptr)
-        p_index->p_recent = p_block;
-    return p_block;
+    const node_t * const p_nodes = p_index->p_nodes;
+    kt_uint32_t          n       = p_index->root;
+    while (n != none && (p_address < p_nodes[n].p_start || p_address >= p_nodes[n].p_start + p_nodes[n].total_bytes))
+        n = p_address < p_nodes[n].p_start ? p_nodes[n].left : p_nodes[n].right;
+    if (n == none)
+        return nullptr;
+    p_index->p_recent = block_at(p_nodes[n]);
+    return p_index->p_recent;
 }
 
 rg_i_free_place_t rg_i_first_fit(rg_i_free_record_index_t * p_index, kt_uint32_t record_length)
@@ -427,7 +498,7 @@ rg_i_free_place_t rg_i_first_fit(rg_i_free_record_index_t * p_index, kt_uint32_t
     const bool          hint_serves = hint.p_record != nullptr && record_length >= p_index->hint_length &&
                              head_at(hint.p_record)->record_length >= record_length;
     if (!hint_serves) {
-        const rg_i_free_place_t found = first_fit_below(p_index->p_root, record_length);
+        const rg_i_free_place_t found = first_fit_below(p_index->p_nodes, p_index->root, record_length);
         if (found.p_record == nullptr)
             return {};
         if (found.p_record != hint.p_record) {

@@ -3,28 +3,41 @@
 //
 // The chain itself stays what it is: records linked in ascending address order. Beside it each block carries, behind
 // its last record and in the same heap block, a summary of the free records that start in it, and the blocks form a
-// tree by address. So neither a search nor the return of a record costs in proportion to the chain, and since the room
-// for the index comes with the block, keeping it can't fail.
+// tree by address. So neither a search nor the return of a record costs in proportion to the chain. All the room that
+// the index needs comes with the blocks, so once a block is there, keeping the index can't fail.
 //
 // Used by the record pool alone. The pool links and unlinks the records, and tells the index what it did.
 #pragma once
 
 #include "rg_i_record_buffer_pool.h"
 
+struct rg_i_free_record_index_t;
+
 // What a block carries behind its records. Segments are 1 KiB of the block each.
 struct rg_i_block_index_t {
-    rg_i_record_buffer_t * p_block;
-    rg_i_block_index_t *   p_left; // the tree of blocks, by address
-    rg_i_block_index_t *   p_right;
-    rg_i_block_index_t *   p_parent;
-    kt_uint32_t            longest_in_subtree; // no free record in this block or the blocks below is longer
-    kt_uint32_t            priority;           // no block below has a higher one
-    kt_uint32_t            clean_from;         // from this byte of the block on, it is zero as it came from the heap
-    kt_uint32_t            segments;
-    kt_uint32_t            bounds;    // entries of p_longest; the last one is for the whole block
-    kt_uint32_t *          p_longest; // by segment, then by 16 segments, by 256 ...: no free record there is longer
-    kt_uint16_t *          p_first;   // by segment: 1 + place in it of its first free record; 0: none starts there
+    rg_i_record_buffer_t *     p_block;
+    rg_i_free_record_index_t * p_index;
+    kt_uint32_t *              p_longest; // by segment, then by 16 segments, by 256 ...: no free record there is longer
+    kt_uint16_t *              p_first;   // by segment: 1 + place in it of its first free record; 0: none starts there
+    kt_uint32_t                segments;
+    kt_uint32_t                bounds;     // entries of p_longest; the last one is for the whole block
+    kt_uint32_t                clean_from; // from this byte of the block on, it is zero as it came from the heap
+    kt_uint32_t                node;       // its place in the tree of blocks
 };
+
+// A block in the tree of blocks, which is ordered by address. The nodes lie together, so that going down the tree
+// touches little memory. Links are numbers of nodes; node 0 stands for none, and its bounds are 0.
+struct rg_i_block_node_t {
+    kt_char_ptr_t p_start;
+    kt_uint32_t   total_bytes;
+    kt_uint32_t   left;
+    kt_uint32_t   right;
+    kt_uint32_t   parent;
+    kt_uint32_t   longest;            // no free record in the block is longer
+    kt_uint32_t   longest_in_subtree; // nor in the blocks below
+};
+
+static_assert(sizeof(rg_i_block_node_t) == 32);
 
 // A free record with its surroundings. No record: p_record is NULL.
 struct rg_i_free_place_t {
@@ -33,23 +46,29 @@ struct rg_i_free_place_t {
     rg_i_block_index_t * p_block;
 };
 
+inline constexpr kt_uint32_t RG_I_FIRST_BLOCK_NODES = 4; // a pool of up to three blocks needs no memory for its tree
+
 // The root, which stands behind the first block's own index.
 struct rg_i_free_record_index_t {
-    rg_i_block_index_t * p_root;
+    rg_i_block_node_t *  p_nodes; // first_nodes, or grown to an array of its own
+    kt_uint32_t          node_count;
+    kt_uint32_t          node_capacity;
+    kt_uint32_t          root;
+    kt_uint32_t          hint_length;
     rg_i_block_index_t * p_recent; // the block that an address was last found in
     // Where the last search ended: every free record before it is shorter than hint_length. So a search for that length
     // or more can begin there, and a run of allocations from one free record doesn't search at all.
     rg_i_free_place_t hint;
-    kt_uint32_t       hint_length;
     bool              hint_previous_known; // p_previous can get lost; p_block does when it is NULL
+    rg_i_block_node_t first_nodes[RG_I_FIRST_BLOCK_NODES];
 };
 
-// Makes a block of total_bytes, zeroed but for its head, with room for the index behind, and for the root if it is the
-// first of its pool. NULL: no memory.
-[[nodiscard]] rg_i_record_buffer_t * rg_i_make_indexed_block(kt_uint32_t total_bytes, bool first_of_pool);
-
-// Enters a block that has no free records yet. If the pool has no index so far, the block brings it.
-rg_i_block_index_t * rg_i_index_block(rg_i_free_record_index_t ** p_p_index, rg_i_record_buffer_t * p_block);
+// Makes a block of total_bytes, zeroed but for its head, with room for the index behind, and enters it, without any
+// free record. A pool that has no index yet (*p_p_index is NULL) gets one with it. NULL: no memory, nothing changed.
+[[nodiscard]] rg_i_block_index_t * rg_i_make_indexed_block(rg_i_free_record_index_t ** p_p_index,
+                                                           kt_uint32_t                 total_bytes);
+// Ahead of freeing the blocks: frees what the index has beside them. NULL is accepted.
+void rg_i_drop_index(rg_i_free_record_index_t * p_index);
 
 // The block that an address lies in, or NULL.
 [[nodiscard]] rg_i_block_index_t * rg_i_block_of(rg_i_free_record_index_t * p_index, const kt_char_t * p_address);

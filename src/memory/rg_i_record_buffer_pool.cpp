@@ -126,20 +126,21 @@ kt_uint32_t insert_free_record(pool_t * p_pool, rg_i_block_index_t * p_block, kt
 {
     if (size + p_pool->total_bytes > UINT32_MAX)
         return false;
-    block_t * const p_block = rg_i_make_indexed_block(static_cast<kt_uint32_t>(size), p_pool->p_free_index == nullptr);
-    if (p_block == nullptr)
+    rg_i_block_index_t * const p_indexed =
+        rg_i_make_indexed_block(&p_pool->p_free_index, static_cast<kt_uint32_t>(size));
+    if (p_indexed == nullptr)
         return false;
 
+    block_t * const p_block = p_indexed->p_block;
     (p_pool->p_last_record_buffer == nullptr ? p_pool->p_first_record_buffer : p_pool->p_last_record_buffer->p_next) =
         p_block;
     p_pool->p_last_record_buffer = p_block;
     p_pool->total_bytes += p_block->total_bytes;
     p_pool->used_bytes += heads_of_a_block;
 
-    rg_i_block_index_t * const p_indexed = rg_i_index_block(&p_pool->p_free_index, p_block);
-    const kt_char_ptr_t        p_record  = first_byte_of(p_block);
-    head_at(p_record)->record_length     = p_block->total_bytes - RG_I_RECORD_BUFFER_HEAD_LENGTH;
-    head_at(p_record)->type              = RG_RECORD_TYPE_FREE;
+    const kt_char_ptr_t p_record     = first_byte_of(p_block);
+    head_at(p_record)->record_length = p_block->total_bytes - RG_I_RECORD_BUFFER_HEAD_LENGTH;
+    head_at(p_record)->type          = RG_RECORD_TYPE_FREE;
     mark_written(p_indexed, p_record + RG_I_RECORD_HEAD_LENGTH);
     insert_free_record(p_pool, p_indexed, p_record);
     return true;
@@ -273,6 +274,7 @@ kt_int32_t rg_i_rb_initialize_record_buffer_pool(kt_uint32_t                 tot
 
 kt_int32_t rg_i_rb_uninitialize_record_buffer_pool(rg_i_record_buffer_pool_t * p_record_buffer_pool)
 {
+    rg_i_drop_index(p_record_buffer_pool->p_free_index);
     for (block_t * p_block = p_record_buffer_pool->p_first_record_buffer; p_block != nullptr;) {
         block_t * const p_next = p_block->p_next;
         std::free(p_block);
@@ -389,17 +391,17 @@ kt_int32_t rg_i_rb_duplicate_record_buffer_pool(rg_i_record_buffer_pool_t * p_fr
     p_to->total_bytes           = p_from->total_bytes - vanishing;
     p_to->used_bytes            = p_from->used_bytes - vanishing;
 
-    block_t * const p_block = make_map_arrays(p_map) ? rg_i_make_indexed_block(p_to->total_bytes, true) : nullptr;
-    if (p_block == nullptr) {
+    rg_i_block_index_t * const p_copy =
+        make_map_arrays(p_map) ? rg_i_make_indexed_block(&p_to->p_free_index, p_to->total_bytes) : nullptr;
+    if (p_copy == nullptr) {
         rg_i_rb_free_duplication_map(p_map);
         return rg_i_fail_no_memory(RG_HERE);
     }
 
     // Nothing below fails.
-    rg_i_block_index_t * const p_copy        = rg_i_index_block(&p_to->p_free_index, p_block);
-    kt_char_ptr_t              p_destination = first_byte_of(p_block);
-    kt_char_ptr_t              p_tail        = nullptr;
-    kt_uint32_t                i             = 0;
+    kt_char_ptr_t p_destination = first_byte_of(p_copy->p_block);
+    kt_char_ptr_t p_tail        = nullptr;
+    kt_uint32_t   i             = 0;
     for (block_t * p_source = p_from->p_first_record_buffer; p_source != nullptr; p_source = p_source->p_next, ++i) {
         enter_into_map(p_map, i, p_source, p_destination);
         rg_i_block_index_t * const p_indexed =
@@ -413,7 +415,7 @@ kt_int32_t rg_i_rb_duplicate_record_buffer_pool(rg_i_record_buffer_pool_t * p_fr
     }
     std::sort(p_map->p_by_address, p_map->p_by_address + p_map->total,
               [p_map](kt_uint32_t a, kt_uint32_t b) { return p_map->p_begin[a] < p_map->p_begin[b]; });
-    p_to->p_first_record_buffer = p_to->p_last_record_buffer = p_block;
+    p_to->p_first_record_buffer = p_to->p_last_record_buffer = p_copy->p_block;
     *p_duplication_map                                       = p_map;
     return 0;
 }

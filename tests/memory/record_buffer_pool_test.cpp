@@ -308,6 +308,34 @@ TEST(finding_room, a_block_without_memory_gives_12_and_changes_nothing)
     EXPECT_EQ(pool.find(5000).length, 9880u);
 }
 
+TEST(finding_room, any_of_many_blocks_without_memory_gives_12_and_the_next_attempt_succeeds)
+{
+    fault_scope faults;
+    test_pool   pool;
+    for (kt_uint32_t blocks = 0; blocks < 40; ++blocks) {
+        const auto        chain  = chain_of(pool);
+        const kt_uint32_t total  = pool.total_bytes;
+        const kt_uint32_t used   = pool.used_bytes;
+        kt_char_ptr_t     p_data = nullptr;
+        for (unsigned nth = 1;; ++nth) {
+            fail_call(call::allocation, nth, ENOMEM);
+            const kt_int32_t rc = rg_i_reserve_record(&pool, 65536 + blocks * 100, RG_RECORD_TYPE_ROW, &p_data);
+            if (rc == 0)
+                break;
+            ASSERT_EQ(rc, RG_E_NO_MEMORY);
+            ASSERT_EQ(chain_of(pool), chain);
+            ASSERT_EQ(pool.total_bytes, total);
+            ASSERT_EQ(pool.used_bytes, used);
+            ASSERT_EQ(blocks_of(pool).size(), blocks);
+        }
+        kt_test::reset_calls();
+        ASSERT_EQ(blocks_of(pool).size(), blocks + 1);
+        if (blocks % 2 == 0)
+            pool.free(p_data);
+    }
+    EXPECT_EQ(used_bytes_by_records(pool), pool.used_bytes);
+}
+
 TEST(finding_room, the_first_record_in_address_order_that_is_long_enough_is_lent)
 {
     test_pool                  pool;
@@ -600,6 +628,22 @@ TEST(zeroed_room, a_reserved_record_is_zero_and_of_its_type)
     EXPECT_EQ(pool.used_bytes, 352u);
     lent = pool.find(1);
     EXPECT_TRUE(all_zero(lent.p_data, lent.length));
+}
+
+TEST(zeroed_room, a_few_bytes_behind_the_last_record_of_a_block_can_be_read_and_are_zero)
+{
+    for (const kt_uint32_t length : {65536u, 65537u, 65541u, 65543u}) {
+        test_pool  pool;
+        const auto lent = pool.find(length);
+        std::memset(lent.p_data, 0x55, lent.length);
+        pool.allocate(lent, lent.length);
+        EXPECT_TRUE(all_zero(lent.p_data + lent.length, RG_I_RECORD_OVERHANG));
+        test_pool                                   copy;
+        rg_i_record_buffer_pool_duplication_map_t * p_map = nullptr;
+        ASSERT_EQ(rg_i_rb_duplicate_record_buffer_pool(&pool, &copy, &p_map), 0);
+        EXPECT_TRUE(all_zero(rg_i_rb_map_duplicated_address(p_map, lent.p_data) + lent.length, RG_I_RECORD_OVERHANG));
+        EXPECT_EQ(rg_i_rb_free_duplication_map(p_map), 0);
+    }
 }
 
 TEST(zeroed_room, a_big_block_that_nothing_is_taken_from_costs_no_memory)
