@@ -7,6 +7,8 @@ if(TARGET ktrg)
   install(TARGETS ktrg RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
 endif()
 
+# The pkg-config file finds the prefix from where it lies itself, so `cmake --install --prefix` may go anywhere.
+file(RELATIVE_PATH KT_PKGCONFIG_TO_PREFIX /prefix/${CMAKE_INSTALL_LIBDIR}/pkgconfig /prefix)
 configure_file(${PROJECT_SOURCE_DIR}/cmake/kt_rg.pc.in ${CMAKE_BINARY_DIR}/kt_rg.pc @ONLY)
 install(FILES ${CMAKE_BINARY_DIR}/kt_rg.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
 

@@ -73,7 +73,7 @@ std::vector<std::string> type_words()
     return words;
 }
 
-// Splits at a character that stands outside parentheses.
+// Splits at a character that stands outside parentheses, brackets and braces.
 std::vector<std::string_view> split_outside(std::string_view text, char separator)
 {
     std::vector<std::string_view> parts;
@@ -83,9 +83,9 @@ std::vector<std::string_view> split_outside(std::string_view text, char separato
         if (i == text.size() || (text[i] == separator && depth == 0)) {
             parts.push_back(text.substr(start, i - start));
             start = i + 1;
-        } else if (text[i] == '(') {
+        } else if (text[i] == '(' || text[i] == '[' || text[i] == '{') {
             depth++;
-        } else if (text[i] == ')') {
+        } else if (text[i] == ')' || text[i] == ']' || text[i] == '}') {
             depth--;
         }
     }
@@ -210,6 +210,14 @@ column parse_column(std::string_view text)
     if (result.is_key() && !can_be_key(result.type))
         refuse(fmt::format("column \"{}\" can't be the key: a key is a number, a string or a handle", result.name));
     return result;
+}
+
+std::vector<column> parse_columns(std::string_view text)
+{
+    std::vector<column> columns;
+    for (const std::string_view part : split_outside(text, ','))
+        columns.push_back(parse_column(part));
+    return columns;
 }
 
 bool is_column_name(std::string_view name)

@@ -78,6 +78,8 @@ struct column {
 
 [[nodiscard]] std::string column_text(const column & of);
 [[nodiscard]] column      parse_column(std::string_view text);
+// Several of them, with commas between.
+[[nodiscard]] std::vector<column> parse_columns(std::string_view text);
 
 // Whether the registry takes the name: a letter, then letters, digits and '_', 255 at most.
 [[nodiscard]] bool is_column_name(std::string_view name);

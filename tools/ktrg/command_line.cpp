@@ -141,7 +141,7 @@ void add_writing_verbs(CLI::App & app, settings & set)
     p_import
         ->add_option("-t,--types", set.import.types,
                      "Types that are not to be detected, as name:type[:flags][=default]")
-        ->delimiter(',')
+
         ->type_name("COL:TYPE,...")
         ->allow_extra_args(false);
     p_import->add_option("--map", set.import.renamed, "The file's column FROM is the table's TO")

@@ -128,7 +128,8 @@ std::vector<column> new_columns(const common_options & common, const import_opti
 {
     std::vector<column> given;
     for (const std::string & text : options.types)
-        given.push_back(parse_column(text));
+        for (column & each : parse_columns(text))
+            given.push_back(std::move(each));
     for (const column & each : given)
         if (std::find(from.names.begin(), from.names.end(), each.name) == from.names.end())
             throw failure(exit_code::usage, where.name,

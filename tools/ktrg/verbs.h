@@ -60,7 +60,7 @@ struct import_options {
     std::string              format; // empty: by the file's name, csv if that says nothing
     bool                     create = false;
     std::string              key;
-    std::vector<std::string> types;   // name:type[:flags][=default]
+    std::vector<std::string> types;   // name:type[:flags][=default],...
     std::vector<std::string> renamed; // a=b: the file's column a is the table's b
 };
 
