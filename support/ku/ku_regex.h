@@ -23,9 +23,10 @@ inline constexpr size_t   ku_regex_most_instructions = 2000;
 inline constexpr size_t   ku_regex_most_table_cells  = 32768;
 inline constexpr unsigned ku_regex_deepest_nesting   = 250;
 inline constexpr unsigned ku_regex_most_repeats      = 255; // in {m,n}, which is what POSIX promises
-// Steps that the regular expressions of one selection expression may cost together. When less than half are left,
-// automata stay nondeterministic.
-inline constexpr uint32_t ku_regex_work = 64 * 1024 * 1024;
+// Steps that the regular expressions of one selection expression may cost together. When less than half are left, or
+// one of them would take more than its share, automata stay nondeterministic.
+inline constexpr uint32_t ku_regex_work       = 16 * 1024 * 1024;
+inline constexpr uint32_t ku_regex_table_work = 2 * 1024 * 1024;
 
 // ---- The expression as a tree ----
 

@@ -17,7 +17,7 @@ namespace
 
 constexpr uint32_t beyond_characters  = 0x110000;
 constexpr uint32_t first_beyond_ascii = 0x80;
-constexpr size_t   least_work         = 8192; // for clearing the scratch memory and for the program's head
+constexpr size_t   least_work         = 4096; // for clearing the scratch memory and for the program's head
 constexpr size_t   node_work          = 64;   // for making an instruction, or finding that there is none to make
 
 class builder
@@ -376,6 +376,7 @@ kt_int32_t builder::make_table()
     uint16_t state = 0;
     if (!add_state(KU_REGEX_AT_START, &state))
         return refuse_memory();
+    size_t all_steps = 0;
     for (size_t s = 0; s < state_members_.count(); s++) {
         for (uint16_t c = 0; c < class_count_; c++) {
             step(state_members_[s], c);
@@ -384,7 +385,9 @@ kt_int32_t builder::make_table()
             if (!add_state(0, &state))
                 return refuse_memory();
             table_[s * class_count_ + c] = state;
-            if (table_.count() > ku_regex_most_table_cells || !spend(steps) || work_ < ku_regex_work / 2) {
+            all_steps += steps;
+            if (table_.count() > ku_regex_most_table_cells || all_steps > ku_regex_table_work || !spend(steps) ||
+                work_ < ku_regex_work / 2) {
                 state_members_.truncate(0); // too large: it stays nondeterministic
                 return 0;
             }
