@@ -9,6 +9,8 @@
 #ifndef KT_RG_H
 #define KT_RG_H
 
+#include <stdarg.h>
+
 #include "kt_types.h"
 
 #ifdef __cplusplus
@@ -510,6 +512,99 @@ kt_int32_t rg_set_fields_by_key_1(rg_opaque_handle_t table_handle, kt_value_t ro
  * docs/ARCHITECTURE.md. */
 kt_int32_t rg_delete_row_by_index_1(rg_opaque_handle_t table_handle, kt_uint32_t row_index);
 
+/* Deletes the rows that match criteria, judged by their applied state, in the table's pending state; on an implicitly
+ * controlled table the deletions are applied and committed as well.
+ *
+ *   selection_criteria  an expression with "$" variables, see docs/SELECTION.md; NULL: all rows, no arguments are taken
+ *   ...                 the values of the variables, in order
+ *
+ * Criteria that no row matches are a success. A row whose evaluation faults, as in a division by zero, doesn't match.
+ *
+ * Returns 0 or:
+ *   RG_E_INVALID_HANDLE         table_handle is NULL
+ *   RG_E_ACCESS                 the table isn't open for writing
+ *   RG_E_INVALID_VARIABLE_TYPE  a wrong "$" variable
+ *   RG_E_NULL_POINTER           a NULL pointer as the value of a $S, $B or $RH variable
+ *   RG_E_APPLIED_UNCOMMITTED    updates are applied and not committed
+ *   RG_E_NO_ROWS_TO_DELETE      the table has no rows, or all are deleted already
+ *   RG_E_LIBRARY_CALL           the criteria can't be compiled (ku_expr_diagnosis_1 says why) or converted
+ *   RG_E_NO_MEMORY              no memory for a change, after which the rows deleted so far stay deleted, or for the
+ *                               criteria
+ *   RG_E_INTERNAL               in a forked child, without an error record
+ * with nothing changed but where it says so; and on an implicitly controlled table the codes of rg_apply_1, with the
+ * deletions taken back, and of rg_commit_1. Thread-safe; the updates of a process run one at a time. */
+kt_int32_t rg_delete_rows_1(rg_opaque_handle_t table_handle, kt_char_ptr_t selection_criteria, ...);
+
+/* ---- Finding rows ----------------------------------------------------------------------------------------------
+ *
+ * Criteria are an expression with "$" variables whose values follow as arguments: see docs/SELECTION.md. Never put a
+ * foreign string into criteria by hand, nor through $S if it may hold a quote: nothing in it is escaped. */
+
+/* Makes a table in memory of the rows that match criteria; it has no name, and is the caller's to close. It stays in
+ * the source's tree and shares nothing else with it.
+ *
+ *   column_names      array_count names of the columns that it has behind the key, which is always its first; not
+ * looked at if array_count is 0, which stands for all columns in the source's order result            receives its
+ * handle selection_string  NULL: all rows
+ *
+ * Committed rows are selected, or the applied ones if the source was made with RG_UNCOMMITTED_UPDATES_VISIBLE in the
+ * environment. They stand from fixed index 0 on in the order of the source's fixed indices. The result is hashed if the
+ * source is. The source must have been made or opened in a tree.
+ *
+ * Returns 0 or, with nothing made:
+ *   RG_E_INVALID_HANDLE         table_handle is NULL
+ *   RG_E_NULL_POINTER           result, a column name, or the value of a $S, $B or $RH variable is NULL
+ *   RG_E_INVALID_VARIABLE_TYPE  a wrong "$" variable
+ *   RG_E_NO_COLUMNS             column_names is NULL and array_count isn't 0
+ *   RG_E_INVALID_COLUMN         no column has one of the names
+ *   RG_E_LIBRARY_CALL           the criteria can't be compiled (ku_expr_diagnosis_1 says why) or converted
+ *   RG_E_DUPLICATE_KEY          without an error record: two rows have one key that a hashed source checks, which
+ * setting the key field can lead to RG_E_TABLE_UNREADABLE       a value of a chosen column leads outside its row: the
+ * table's file is damaged RG_E_NO_MEMORY Thread-safe; other changes of the tree wait meanwhile. */
+kt_int32_t rg_select_1(rg_opaque_handle_t table_handle, kt_char_ptr_t * column_names, kt_uint32_t array_count,
+                       rg_opaque_handle_t * result, kt_char_ptr_t selection_string, ...);
+
+/* Lists the fixed indices of the rows that match criteria, in ascending order.
+ *
+ *   p_selection_criteria           NULL: all rows
+ *   ap                             the values of the variables
+ *   uncommitted_updates_visible    not 0: rows of the applied state are looked at, else those of the committed state,
+ * but for a table that was made with RG_UNCOMMITTED_UPDATES_VISIBLE in the environment p_total_selected_rows receives
+ * how many p_p_selected_rows_fixed_index  receives the list, which the caller frees, also if it is empty
+ *
+ * Whichever rows are looked at, each is judged by its applied values; one whose deletion is pending matches no
+ * criteria.
+ *
+ * Returns 0, RG_E_INVALID_HANDLE, RG_E_NULL_POINTER, RG_E_INVALID_VARIABLE_TYPE, RG_E_LIBRARY_CALL or RG_E_NO_MEMORY,
+ * as above, with nothing delivered. Thread-safe. */
+kt_int32_t rg_get_selected_rows_v_1(rg_opaque_handle_t table_handle, kt_char_ptr_t p_selection_criteria, va_list ap,
+                                    kt_uint32_t uncommitted_updates_visible, kt_uint32_t * p_total_selected_rows,
+                                    kt_uint32_t ** p_p_selected_rows_fixed_index);
+
+/* Lists the fixed indices of the rows with pending changes: those added or set, in the order of their first change, and
+ * behind them those deleted.
+ *
+ *   p_updated_rows_count            receives how many were added or set: the deleted rows behind them aren't counted
+ *   p_p_updated_rows_fixed_indices  receives the list, which the caller frees; NULL if nothing is pending
+ *
+ * Returns 0, RG_E_INVALID_HANDLE, RG_E_NULL_POINTER or RG_E_NO_MEMORY, with nothing delivered. Thread-safe. */
+kt_int32_t rg_get_updated_rows_1(rg_opaque_handle_t table_handle, kt_uint32_t * p_updated_rows_count,
+                                 kt_uint32_t ** p_p_updated_rows_fixed_indices);
+
+/* Lists the fixed indices of the rows that have a key: on a hashed table the row added last comes first, on any other
+ * they ascend. The key is compared as it stands, without conversion of strings.
+ *
+ *   p_duplicate_rows_count            receives how many
+ *   p_p_duplicate_rows_fixed_indices  receives the list, which the caller frees
+ *   uncommitted_updates_visible       not 0: rows of the applied state, else of the committed one; nothing else counts
+ *
+ * Returns 0, RG_E_INVALID_HANDLE, RG_E_NULL_POINTER (also for a NULL pointer as key), RG_E_NO_SUCH_KEY, RG_E_INTERNAL
+ * if the hash function gave no bucket, or RG_E_NO_MEMORY, with nothing delivered. Thread-safe. */
+kt_int32_t rg_get_duplicate_rows_1(rg_opaque_handle_t table_handle, kt_value_t key_value,
+                                   kt_uint32_t *  p_duplicate_rows_count,
+                                   kt_uint32_t ** p_p_duplicate_rows_fixed_indices,
+                                   kt_uint32_t    uncommitted_updates_visible);
+
 /* ---- The application's own data -------------------------------------------------------------------------------- */
 
 /* A table carries one binary of the application's beside its rows. It is applied, committed and aborted with them, and
@@ -609,8 +704,8 @@ kt_int32_t rg_repair_tables_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t * p_
  *   RG_E_LIBRARY_CALL    a default value is damaged, or the buffer would exceed 4 GiB - 1
  *   RG_E_INTERNAL        a definition of structured data has field names so short that its packed form can't be walked
  *   RG_E_SYSTEM_CALL     a lock fails
- * Thread-safe; also in a forked child. All tables are read-locked together, so the buffer holds one moment. A default of
- * structured data doesn't travel, nor does the application's own binary. See docs/PACKED-FORMAT.md,
+ * Thread-safe; also in a forked child. All tables are read-locked together, so the buffer holds one moment. A default
+ * of structured data doesn't travel, nor does the application's own binary. See docs/PACKED-FORMAT.md,
  * docs/BAD-INPUT.md. */
 kt_int32_t rg_pack_tables_1(kt_uint32_t total_tables, rg_opaque_handle_t * p_table_handles,
                             kt_uint32_t * p_uncommitted_updates_visible, kt_uint32_t * p_total_row_fixed_indices,

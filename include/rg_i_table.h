@@ -335,3 +335,5 @@ kt_int32_t                rg_i_abort(rg_i_table_t * p_table);
 
 // RG_E_ROW_DELETED, with nothing changed, if the row's deletion is pending already.
 [[nodiscard]] kt_int32_t rg_i_delete_row(rg_i_table_t * p_table, rg_i_index_entry_t * p_current_index_entry);
+// The rows that match the rendered criteria; all rows if there are none.
+[[nodiscard]] kt_int32_t rg_i_delete_rows(rg_i_table_t * p_table, kt_char_ptr_t p_selection_criteria);

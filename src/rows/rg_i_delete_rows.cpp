@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: MIT
 // rg_i_delete_rows: marks rows as gone in the table's pending state.
 //
-// Layer: rows. Stands on the change lists, the record pool and the hash table.
+// Layer: rows. Stands on the change lists, the record pool, the hash table and the criteria.
 // Always holds: until commit the row keeps its slot, its packed position, its hash element and its committed record;
 // what goes at once is an applied record that isn't the committed one. So packed positions stay put while a caller
 // deletes one row after the other.
@@ -11,6 +11,8 @@
 
 #include "frame/rg_i_trace.h"
 #include "rg_i_table.h"
+#include "rows/rg_i_criteria.h"
+#include "rows/rg_i_row_walk.h"
 
 namespace
 {
@@ -63,4 +65,21 @@ kt_int32_t rg_i_delete_row(rg_i_table_t * p_table, rg_i_index_entry_t * p_curren
     p_current_index_entry->p_applied = nullptr;
     ++p_table->applied_deletions;
     return 0;
+}
+
+kt_int32_t rg_i_delete_rows(rg_i_table_t * p_table, kt_char_ptr_t p_selection_criteria)
+{
+    if (p_table->ready_for_commit != 0)
+        return rg_i_fail(RG_HERE, RG_E_APPLIED_UNCOMMITTED);
+    if (rg_i_rows_in_role(p_table, row_role::applied) == 0)
+        return rg_i_fail(RG_HERE, RG_E_NO_ROWS_TO_DELETE);
+    rg_i_criteria criteria;
+    if (const kt_int32_t rc = criteria.compile(p_selection_criteria, p_table); rc != 0)
+        return rc;
+    return rg_i_walk_rows(p_table, row_role::applied, [&](kt_uint32_t slot, kt_char_ptr_t p_record) -> kt_int32_t {
+        bool matches = false;
+        if (const kt_int32_t rc = criteria.look_at(p_record, &matches); rc != 0)
+            return rc;
+        return matches ? rg_i_delete_row(p_table, &p_table->p_rows_fixed_index[slot]) : 0;
+    });
 }
