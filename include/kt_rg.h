@@ -540,16 +540,17 @@ kt_int32_t rg_delete_rows_1(rg_opaque_handle_t table_handle, kt_char_ptr_t selec
  * Criteria are an expression with "$" variables whose values follow as arguments: see docs/SELECTION.md. Never put a
  * foreign string into criteria by hand, nor through $S if it may hold a quote: nothing in it is escaped. */
 
-/* Makes a table in memory of the rows that match criteria; it has no name, and is the caller's to close. It stays in
- * the source's tree and shares nothing else with it.
+/* Makes a table in memory of the rows that match criteria. It has no name and is the caller's to close. It stays in the
+ * source's tree and shares nothing else with it.
  *
  *   column_names      array_count names of the columns that it has behind the key, which is always its first; not
- * looked at if array_count is 0, which stands for all columns in the source's order result            receives its
- * handle selection_string  NULL: all rows
+ *                     looked at if array_count is 0, which stands for all columns in the source's order
+ *   result            receives its handle
+ *   selection_string  NULL: all rows
  *
  * Committed rows are selected, or the applied ones if the source was made with RG_UNCOMMITTED_UPDATES_VISIBLE in the
  * environment. They stand from fixed index 0 on in the order of the source's fixed indices. The result is hashed if the
- * source is. The source must have been made or opened in a tree.
+ * source is.
  *
  * Returns 0 or, with nothing made:
  *   RG_E_INVALID_HANDLE         table_handle is NULL
@@ -558,9 +559,11 @@ kt_int32_t rg_delete_rows_1(rg_opaque_handle_t table_handle, kt_char_ptr_t selec
  *   RG_E_NO_COLUMNS             column_names is NULL and array_count isn't 0
  *   RG_E_INVALID_COLUMN         no column has one of the names
  *   RG_E_LIBRARY_CALL           the criteria can't be compiled (ku_expr_diagnosis_1 says why) or converted
- *   RG_E_DUPLICATE_KEY          without an error record: two rows have one key that a hashed source checks, which
- * setting the key field can lead to RG_E_TABLE_UNREADABLE       a value of a chosen column leads outside its row: the
- * table's file is damaged RG_E_NO_MEMORY Thread-safe; other changes of the tree wait meanwhile. */
+ *   RG_E_DUPLICATE_KEY          without an error record: two rows of a hashed source have one key, which setting the
+ *                               key field can lead to
+ *   RG_E_TABLE_UNREADABLE       a value of a chosen column leads outside its row: the table's file is damaged
+ *   RG_E_NO_MEMORY              no memory for the result
+ * Thread-safe; other changes of the tree wait meanwhile. */
 kt_int32_t rg_select_1(rg_opaque_handle_t table_handle, kt_char_ptr_t * column_names, kt_uint32_t array_count,
                        rg_opaque_handle_t * result, kt_char_ptr_t selection_string, ...);
 
@@ -568,11 +571,12 @@ kt_int32_t rg_select_1(rg_opaque_handle_t table_handle, kt_char_ptr_t * column_n
  *
  *   p_selection_criteria           NULL: all rows
  *   ap                             the values of the variables
- *   uncommitted_updates_visible    not 0: rows of the applied state are looked at, else those of the committed state,
- * but for a table that was made with RG_UNCOMMITTED_UPDATES_VISIBLE in the environment p_total_selected_rows receives
- * how many p_p_selected_rows_fixed_index  receives the list, which the caller frees, also if it is empty
+ *   uncommitted_updates_visible    not 0: the rows of the applied state are looked at, else those of the committed one,
+ *                                  unless the table was made with RG_UNCOMMITTED_UPDATES_VISIBLE in the environment
+ *   p_total_selected_rows          receives how many
+ *   p_p_selected_rows_fixed_index  receives the list, which the caller frees, also if it is empty
  *
- * Whichever rows are looked at, each is judged by its applied values; one whose deletion is pending matches no
+ * Whichever rows are looked at, each is judged by its applied values; a row whose deletion is pending matches no
  * criteria.
  *
  * Returns 0, RG_E_INVALID_HANDLE, RG_E_NULL_POINTER, RG_E_INVALID_VARIABLE_TYPE, RG_E_LIBRARY_CALL or RG_E_NO_MEMORY,

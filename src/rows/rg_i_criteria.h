@@ -11,7 +11,8 @@
 // Renders the format with the values of ap. *result comes back with the text, which the caller frees, also after a
 // failure (then it is what was rendered so far, or NULL).
 [[nodiscard]] kt_int32_t rg_i_select_printf(kt_char_ptr_t * result, kt_char_ptr_t selectionCriteria, va_list ap);
-// The text's growth and append step. A NULL buffer makes room and appends nothing. A failure frees the text.
+// The text's growth and append step. *to stands *currentResultBytes behind *result. A NULL buffer makes room and
+// appends nothing. A failure frees the text.
 [[nodiscard]] kt_int32_t rg_i_append_buffer_to_result(kt_uint32_t * currentResultBytes, kt_uint32_t * maxResultBytes,
                                                       kt_uint32_t length, kt_char_ptr_t * result, kt_char_ptr_t * to,
                                                       const kt_char_t * buffer);

@@ -9,7 +9,6 @@
 #include <locale.h>
 
 #include <cinttypes>
-#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -179,7 +178,6 @@ kt_int32_t rg_i_append_buffer_to_result(kt_uint32_t * currentResultBytes, kt_uin
     if (wanted > maximum)
         maximum += (wanted - maximum + growth_step - 1) / growth_step * growth_step;
     if (maximum != *maxResultBytes) {
-        const size_t  position = reinterpret_cast<std::uintptr_t>(*to) - reinterpret_cast<std::uintptr_t>(*result);
         kt_char_ptr_t p_grown =
             maximum <= UINT32_MAX ? static_cast<kt_char_ptr_t>(std::realloc(*result, maximum)) : nullptr;
         if (p_grown == nullptr) {
@@ -188,7 +186,7 @@ kt_int32_t rg_i_append_buffer_to_result(kt_uint32_t * currentResultBytes, kt_uin
             return rg_i_fail_no_memory(RG_HERE);
         }
         *result         = p_grown;
-        *to             = p_grown + position;
+        *to             = p_grown + *currentResultBytes;
         *maxResultBytes = static_cast<kt_uint32_t>(maximum);
     }
     if (buffer == nullptr)
