@@ -792,6 +792,89 @@ kt_int32_t rg_unpack_table_1(void * p_buffer, kt_uint32_t total_hash_buckets, rg
                              rg_hash_keys_compare_function_t * compare_function, rg_opaque_handle_t tree_handle,
                              kt_uint32_t table_index, rg_opaque_handle_t * p_table);
 
+/* ---- Telling what there is ------------------------------------------------------------------------------------- */
+
+/* Lists the tables under a path. Under a mount point these are the files of its directory, also those that nobody has
+ * opened; elsewhere the tree's transient tables, also those that nobody has open. The path is a plain prefix of the
+ * tables' names, and the order is none.
+ *
+ *   tree_handle      the tree
+ *   p_registry_path  a registry path; a mount point may be given with or without its trailing "/"
+ *   p_table_list     receives an array of registry paths, never NULL, to be given back through rg_free_table_list_1;
+ *                    untouched after a failure
+ *   array_count      receives the number of tables, maybe 0; untouched after a failure
+ *
+ * Returns 0; RG_E_INVALID_HANDLE; RG_E_INVALID_PATH, also for a NULL path; RG_E_NULL_POINTER if a result pointer is
+ * NULL; RG_E_ACCESS if the directory may not be read; RG_E_SYSTEM_CALL if it can't be, or the tree's lock fails;
+ * RG_E_NO_MEMORY. Thread-safe; holds the tree's write lock while it lists, directory reading included. */
+kt_int32_t rg_list_tables_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path,
+                            kt_char_ptr_t ** p_table_list, kt_uint32_t * array_count);
+
+/* Gives back a list of rg_list_tables_1 with its strings.
+ *
+ *   p_table_list  the list; entries that are NULL are passed over
+ *   array_count   the count that came with it
+ *
+ * Returns 0; RG_E_NULL_POINTER for a NULL list. Takes no lock. */
+kt_int32_t rg_free_table_list_1(kt_char_ptr_t * p_table_list, kt_uint32_t array_count);
+
+/* What a table tells about itself. Nothing in it points into the table: it outlives the table's handle. */
+typedef struct rg_table_metadata_t {
+    kt_char_ptr_t name;                 /* registry path, or the name in memory; "" for a selection result */
+    kt_uint32_t   number_of_rows;       /* committed, or applied if the table shows those; pending deletions count */
+    kt_uint32_t   number_of_columns;    /* of the table, or of column_definitions if they were asked for */
+    kt_uint64_t   table_change_counter; /* of the committed state */
+    kt_int32_t    properties;           /* 0 */
+    rg_column_t * column_definitions;   /* NULL, or number_of_columns definitions in client form */
+} rg_table_metadata_t;
+
+KT_STATIC_ASSERT(sizeof(rg_table_metadata_t) == 40 && offsetof(rg_table_metadata_t, table_change_counter) == 16 &&
+                     offsetof(rg_table_metadata_t, column_definitions) == 32,
+                 "rg_table_metadata_t");
+
+/* Describes an open table.
+ *
+ *   table_handle   the table
+ *   all_metadata   0: no column definitions; -1: those of all columns; anything else: those of the columns that aren't
+ *                  RG_INVISIBLE
+ *   p_p_metadata   receives the description, to be given back through rg_free_table_metadata_1; untouched after a
+ *                  failure
+ *
+ * Returns 0; RG_E_INVALID_HANDLE; RG_E_NULL_POINTER for a NULL p_p_metadata; RG_E_NO_MEMORY; RG_E_LIBRARY_CALL if a
+ * default value can't be made; RG_E_SYSTEM_CALL if the table's lock fails. After a failure behind the handle and the
+ * lock the error record doesn't tell it: docs/ODDITIES.md. Thread-safe; takes the table's read lock. */
+kt_int32_t rg_get_table_metadata_1(rg_opaque_handle_t table_handle, kt_int32_t all_metadata,
+                                   rg_table_metadata_t ** p_p_metadata);
+
+/* Gives back a description with all that it owns. Returns 0; RG_E_NULL_POINTER for NULL. Takes no lock. */
+kt_int32_t rg_free_table_metadata_1(rg_table_metadata_t * p_metadata);
+
+/* The list of tables in the shape of an older directory interface. A registry has no directories. */
+typedef kt_uint32_t rg_entry_t;
+enum { RG_TABLE = 1 };
+typedef kt_uint32_t rg_storage_t;
+enum { RG_UNKNOWN_STORAGE = 0 };
+
+typedef struct rg_entry_metadata_t {
+    kt_char_ptr_t   name;
+    rg_entry_t      type;         /* RG_TABLE */
+    rg_storage_t    storage;      /* RG_UNKNOWN_STORAGE */
+    kt_char_ptr_t * p_table_list; /* the whole list, the same in every entry */
+} rg_entry_metadata_t;
+
+KT_STATIC_ASSERT(sizeof(rg_entry_metadata_t) == 24 && offsetof(rg_entry_metadata_t, p_table_list) == 16,
+                 "rg_entry_metadata_t");
+
+/* As rg_list_tables_1, with an entry a table, to be given back through rg_i_free_directory_list_compat. Without tables
+ * *entry_list is NULL and *array_count 0. Returns what rg_list_tables_1 returns. */
+kt_int32_t rg_i_get_directory_list_compat(rg_opaque_handle_t tree_handle, kt_char_ptr_t directory_name,
+                                          rg_entry_metadata_t ** entry_list, kt_uint32_t * array_count);
+/* Gives such a list back. NULL is accepted. Returns 0. */
+kt_int32_t rg_i_free_directory_list_compat(rg_entry_metadata_t * entry_list, kt_uint32_t array_count);
+/* Do nothing, and return 0. */
+kt_int32_t rg_i_create_directory_compat(void);
+kt_int32_t rg_i_delete_directory_compat(void);
+
 #pragma GCC visibility pop
 #ifdef __cplusplus
 }

@@ -61,9 +61,13 @@ void rg_i_mount_point_delete_action(const void * p_node, VISIT type, int level);
 void rg_i_table_delete_action(const void * p_node, VISIT type, int level);         // rg_i_close_table
 void rg_i_unnamed_table_delete_action(const void * p_node, VISIT type, int level); // rg_i_close_table
 
+void rg_i_list_tables_action(const void * p_node, VISIT type, int level); // enters a transient table in p_list
+
 // ---- Registry paths (rg_i_paths) ----
 
-[[nodiscard]] kt_int32_t rg_i_check_path_syntax(kt_char_ptr_t p_path);
+// The mount point that the path lies under; NULL: none. The path's syntax has been checked.
+[[nodiscard]] const rg_i_mount_point_t * rg_i_find_mount_point(const rg_i_tree_t * p_tree, const kt_char_t * p_path);
+[[nodiscard]] kt_int32_t                 rg_i_check_path_syntax(kt_char_ptr_t p_path);
 // The name that p_tables knows: a new allocation if *p_persistent comes back non-zero, else p_registry_path itself.
 [[nodiscard]] kt_int32_t rg_i_resolve_path(rg_i_tree_t * p_tree, kt_char_ptr_t p_registry_path,
                                            kt_char_ptr_t * p_absolute_registry_path, kt_uint32_t * p_persistent);

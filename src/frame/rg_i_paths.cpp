@@ -84,13 +84,6 @@ const rg_i_mount_point_t * find_by_beginnings(void * const * p_mount_points, con
     return nullptr;
 }
 
-// The mount point that the path lies under; NULL: none. The path's syntax has been checked.
-const rg_i_mount_point_t * find_mount_point(void * const * p_mount_points, const kt_char_t * p_path)
-{
-    const auto * p_found = element_of(tfind(p_path, p_mount_points, rg_i_string_to_mount_point_compare));
-    return p_found != nullptr ? p_found : find_by_beginnings(p_mount_points, p_path);
-}
-
 // The path of the file: the mount's directory, and the rest of the registry path with every "/" but the first made ",".
 [[nodiscard]] kt_char_ptr_t make_file_path(const rg_i_mount_point_t & mount_point, const kt_char_t * p_registry_path)
 {
@@ -138,13 +131,19 @@ kt_int32_t rg_i_check_path_syntax(kt_char_ptr_t p_path)
     return p_path != nullptr && path_is_allowed(p_path) ? 0 : rg_i_fail_invalid_path(RG_HERE, p_path);
 }
 
+const rg_i_mount_point_t * rg_i_find_mount_point(const rg_i_tree_t * p_tree, const kt_char_t * p_path)
+{
+    const auto * p_found = element_of(tfind(p_path, &p_tree->p_mount_points, rg_i_string_to_mount_point_compare));
+    return p_found != nullptr ? p_found : find_by_beginnings(&p_tree->p_mount_points, p_path);
+}
+
 kt_int32_t rg_i_resolve_path(rg_i_tree_t * p_tree, kt_char_ptr_t p_registry_path,
                              kt_char_ptr_t * p_absolute_registry_path, kt_uint32_t * p_persistent)
 {
     if (const kt_int32_t rc = rg_i_check_path_syntax(p_registry_path); rc != 0)
         return rc;
 
-    const rg_i_mount_point_t * p_mount_point = find_mount_point(&p_tree->p_mount_points, p_registry_path);
+    const rg_i_mount_point_t * p_mount_point = rg_i_find_mount_point(p_tree, p_registry_path);
     if (p_mount_point == nullptr) {
         *p_absolute_registry_path = p_registry_path;
         *p_persistent             = 0;
