@@ -20,16 +20,18 @@ struct exported_call {
 // Each exported call, given the handle and otherwise good arguments.
 inline const std::vector<exported_call> & all_calls()
 {
-    static kt_char_ptr_t  name   = text("K");
-    static kt_char_ptr_t  path   = text("/t");
-    static kt_char_ptr_t  dir    = text("/tmp");
-    static kt_value_t     value  = uint32(1);
-    static kt_value_t *   values = &value;
-    static rg_column_t    key    = column("K", KT_UINT32, RG_PRIMARY_KEY);
-    static rg_row_state_t state;
-    static kt_uint32_t    index;
-    static kt_binary_t    binary{1, {0}};
-    static kt_binary_t *  p_binary;
+    static kt_char_ptr_t         name   = text("K");
+    static kt_char_ptr_t         path   = text("/t");
+    static kt_char_ptr_t         dir    = text("/tmp");
+    static kt_value_t            value  = uint32(1);
+    static kt_value_t *          values = &value;
+    static rg_column_t           key    = column("K", KT_UINT32, RG_PRIMARY_KEY);
+    static rg_row_state_t        state;
+    static kt_uint32_t           index;
+    static kt_binary_t           binary{1, {0}};
+    static kt_binary_t *         p_binary;
+    static kt_char_ptr_t *       p_list;
+    static rg_table_metadata_t * p_metadata;
     using handle_t = rg_opaque_handle_t;
     static handle_t result;
 
@@ -67,6 +69,7 @@ inline const std::vector<exported_call> & all_calls()
          [](handle_t h) { return rg_get_fields_by_key_1(h, value, &name, &values, 1); }},
         {"rg_get_fields_by_key_and_visibility_1", 61, false,
          [](handle_t h) { return rg_get_fields_by_key_and_visibility_1(h, value, &name, &values, 1, 0, &state); }},
+        {"rg_list_tables_1", 69, false, [](handle_t h) { return rg_list_tables_1(h, path, &p_list, &index); }},
         {"rg_mount_local_tree_1", 71, true, [](handle_t h) { return rg_mount_local_tree_1(h, path, dir, 1); }},
         {"rg_open_table_1", 77, false, [](handle_t h) { return rg_open_table_1(h, path, 2, &result); }},
         {"rg_open_hashed_key_table_1", 79, false,
@@ -86,6 +89,7 @@ inline const std::vector<exported_call> & all_calls()
         {"rg_set_fields_by_key_1", 103, true,
          [](handle_t h) { return rg_set_fields_by_key_1(h, value, &name, &values, 1); }},
         {"rg_unmount_local_tree_1", 105, false, [](handle_t h) { return rg_unmount_local_tree_1(h, path); }},
+        {"rg_get_table_metadata_1", 65, false, [](handle_t h) { return rg_get_table_metadata_1(h, 0, &p_metadata); }},
         {"rg_get_fixed_row_index_for_key_1", 107, false,
          [](handle_t h) { return rg_get_fixed_row_index_for_key_1(h, value, &index); }},
     };
