@@ -2,10 +2,11 @@
 // rg_i_commit: makes what was applied the table's state. The second half of a transaction.
 //
 // Layer: storage. Calls the file wrappers (rg_i_files); called by the frames and by column changes.
-// Always holds: one small act changes what a reader of the file finds: the overwrite of the old commit record's type,
-// or the rename of the rewrite file. Memory follows the file, never the other way round, and no cancellation of the
-// thread can come between the two. Locking: the caller holds the table's write lock. Failure: nothing is committed in
-// memory, and the table stays applied. What stands in the file is told at each step.
+// Always holds: one small act changes what a reader of the file finds: an overwrite of the old commit record's type, or
+// the rename of the rewrite file. Memory follows the file, never the other way round, and no cancellation of the thread
+// can come between the two.
+// Locking: the caller holds the table's write lock.
+// Failure: nothing is committed in memory, and the table stays applied. What the file holds is told at each step.
 #include <pthread.h>
 #include <unistd.h>
 

@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <fstream>
 #include <thread>
 
 #include "storage/table_files.h"
@@ -74,7 +75,8 @@ class other_process
         waitpid(std::exchange(child_, -1), &status, 0);
         return WIFEXITED(status) && WEXITSTATUS(status) == 0;
     }
-    void end_by_kill()
+    pid_t id() const { return child_; }
+    void  end_by_kill()
     {
         kill(child_, SIGKILL);
         waitpid(std::exchange(child_, -1), nullptr, 0);
@@ -83,6 +85,20 @@ class other_process
   private:
     pid_t child_;
 };
+
+// Comes back when the process waits for a file's lock. The system lists those who wait with an arrow.
+void await_waiter(pid_t process)
+{
+    const std::string name = " " + std::to_string(process) + " ";
+    for (int i = 0; i < 2000; ++i) {
+        std::ifstream locks("/proc/locks");
+        for (std::string line; std::getline(locks, line);)
+            if (line.find("->") != std::string::npos && line.find(name) != std::string::npos)
+                return;
+        usleep(10000);
+    }
+    ADD_FAILURE() << "nobody waits";
+}
 
 struct processes : testing::Test {
     temp_dir          dir;
@@ -136,7 +152,8 @@ TEST_F(processes, a_second_writer_waits_until_the_first_closes_and_then_sees_its
     EXPECT_EQ(add(table, 2, 2), 0);
     EXPECT_EQ(rg_apply_1(table, 0), 0);
     EXPECT_EQ(rg_commit_1(table), 0);
-    EXPECT_FALSE(opened.came(100)) << "it waits in the lock";
+    await_waiter(second.id());
+    EXPECT_FALSE(opened.came(0));
     EXPECT_EQ(rg_close_table_1(table), 0);
     EXPECT_TRUE(opened.came());
     EXPECT_TRUE(second.result());
@@ -246,16 +263,13 @@ TEST_F(processes, a_writer_that_waited_while_a_rewrite_took_the_name_works_on_th
 {
     at_registry        r(dir);
     rg_opaque_handle_t table = r.open(explicitly);
-    signal_pipe        waiting;
     other_process      waiter([&] {
-        at_registry other(dir);
-        waiting.give();
+        at_registry        other(dir);
         rg_opaque_handle_t waited = other.open(RG_MODE_WRITE);
         // It has the lock of the unlinked file and reads its old contents; what it commits goes down with it.
         return rows_of(waited) == rows{{1, 1}} && add(waited, 9, 9) == 0 && rg_close_table_1(waited) == 0;
     });
-    ASSERT_TRUE(waiting.came());
-    usleep(100000);
+    await_waiter(waiter.id());
     EXPECT_EQ(add(table, 2, 2), 0);
     EXPECT_EQ(rg_i_apply(&object(table), 1, 0), 0);
     EXPECT_EQ(rg_commit_1(table), 0);
@@ -316,15 +330,13 @@ TEST_F(processes, that_each_hold_a_table_and_wait_for_the_others_on_another_thre
     file_image image;
     image.commit(1);
     write_file(dir.file("u"), image.content());
-    signal_pipe   child_holds, parent_waits;
+    signal_pipe   child_holds;
     other_process child([&] {
         at_registry other(dir);
         if (open_table(other.tree, "/r/u", RG_MODE_WRITE) == nullptr)
             return false;
         child_holds.give();
-        if (!parent_waits.came())
-            return false;
-        usleep(200000);
+        await_waiter(getppid());
         kt_int32_t  rc = 0;
         std::thread asker([&] {
             at_registry third(dir); // a tree of its own, as another part of the program would have
@@ -341,7 +353,6 @@ TEST_F(processes, that_each_hold_a_table_and_wait_for_the_others_on_another_thre
     kt_int32_t  waiter_rc = -1;
     std::thread waiter([&] {
         at_registry other(dir);
-        parent_waits.give();
         if (open_table(other.tree, "/r/u", RG_MODE_WRITE, &waiter_rc) != nullptr)
             waiter_rc = 0;
     });
