@@ -211,15 +211,17 @@ TEST(unpacking, under_a_mount_point_it_is_refused_without_a_record)
 
 TEST(unpacking, a_name_that_is_taken_is_refused)
 {
-    octets     buffer = local_buffer(small_table());
-    open_tree  tree;
-    kt_int32_t rc = 0;
-    ASSERT_NE(unpacked(buffer, tree), nullptr);
+    octets                   buffer = local_buffer(small_table());
+    open_tree                tree;
+    kt_int32_t               rc    = 0;
+    const rg_opaque_handle_t first = unpacked(buffer, tree);
+    ASSERT_NE(first, nullptr);
     unpacked(buffer, tree, 0, &rc);
     EXPECT_EQ(rc, RG_E_TABLE_EXISTS);
     EXPECT_EQ(error_code(), RG_E_TABLE_EXISTS);
     rg_opaque_handle_t handle = nullptr;
     EXPECT_EQ(unpack_hashed(buffer, 1024, hash_uint32, compare_uint32, tree, &handle), RG_E_TABLE_EXISTS);
+    ASSERT_EQ(rg_close_table_1(first), 0);
     ASSERT_EQ(rg_delete_table_1(tree, text("small")), 0);
     EXPECT_NE(unpacked(buffer, tree), nullptr) << "its name is free again";
 }
