@@ -10,6 +10,7 @@
 #define KT_RG_H
 
 #include <stdarg.h>
+#include <stdio.h>
 
 #include "kt_types.h"
 
@@ -663,6 +664,62 @@ kt_int32_t rg_get_application_metadata_1(rg_opaque_handle_t table_handle, kt_bin
  * Thread-safe; the updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
 kt_int32_t rg_delete_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path);
 
+/* Copies a table to another registry path: whole, with its columns, rows and the application's data. Where source and
+ * target lie decides how:
+ *
+ *   - A table that is in the tree's memory, open or not, is copied from there, also if it has a file. A path under a
+ *     mount point that no table of the tree stands for is copied from its file.
+ *   - To a path under a mount point, a copy from memory writes what a rewrite of the table would: pending updates go
+ *     along, but the change counter is the committed one. A copy from a file copies its bytes. The new file is prepared
+ *     beside the target, synced, and renamed, so that a reader finds the old target or the new one. Where the target is
+ *     open in the tree, its handles show the new contents afterwards.
+ *   - To another path the copy lives in memory, with the row indices of its source. It stays good whatever becomes of
+ *     the source. A table with anything pending or applied can't be copied so.
+ *
+ * A copy to a file waits until no other process copies into the directory or has the target open for writing, with the
+ * tree locked.
+ *
+ *   table_handle         the source; or tree_handle and p_source_table_name, its path
+ *   p_target_table_name  the target's path
+ *   overwrite            not 0: the target may exist. In memory its handles dangle from then on. A target file of no
+ *                        length counts as none
+ *
+ * Returns 0 or, with source and target as they were:
+ *   RG_E_INVALID_HANDLE     the handle is NULL
+ *   RG_E_INVALID_PATH       a path can't be one
+ *   RG_E_NO_SUCH_TABLE      no such source. An empty target file may have been made
+ *   RG_E_TABLE_EXISTS       the target exists and overwrite is 0; or source and target are one and the same table, in
+ *                           memory or for a move. A table with a file may be copied onto itself, with overwrite
+ *   RG_E_UNCOMMITTED_TABLE  copying in memory, with updates pending or applied
+ *   RG_E_DUPLICATE_KEY      copying in memory, with two rows of one key that were set so; without an error record
+ *   RG_E_ACCESS             no permission for a file
+ *   RG_E_FILESYSTEM_FULL_DETAIL, RG_E_SYSTEM_CALL  a file can't be opened, locked, read, written or renamed: "lockf" if
+ *                           the target is open for reading only in this tree, "rename" if a file would be moved to
+ *                           another file system, "writev" if the file would pass 4 GiB
+ *   RG_E_TABLE_UNREADABLE, RG_E_BAD_REPLACES_OFFSET, RG_E_BAD_DELETED_ROW_OFFSET, RG_E_NO_COMMIT_RECORD
+ *                           a file that is copied into memory is damaged
+ *   RG_E_NO_MEMORY          no memory
+ *   RG_E_INTERNAL           in a forked child, without an error record
+ * Where the target is open with a hash table, a failure of the copy itself, RG_E_TABLE_EXISTS among them, is forgotten:
+ * the call returns 0 and the target is read afresh from its unchanged file. Thread-safe; the updates of a process run
+ * one at a time. See docs/ARCHITECTURE.md, docs/FILE-FORMAT.md, docs/BAD-INPUT.md. */
+kt_int32_t rg_copy_table_by_handle_1(rg_opaque_handle_t table_handle, kt_char_ptr_t p_target_table_name,
+                                     kt_int32_t overwrite);
+kt_int32_t rg_copy_table_by_name_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_source_table_name,
+                                   kt_char_ptr_t p_target_table_name, kt_int32_t overwrite);
+/* Moves a table to another registry path. To a path under a mount point a table in memory is copied as above and then
+ * removed, and a file is renamed; to another path the table object itself takes the new name, pending updates and all,
+ * and a file is read into memory and then removed. A table in memory that has a file loses it, and goes on with the file
+ * that it has open.
+ *
+ * A source that can't be removed doesn't fail a move. Handles on a source that was written to a file stay good, on a
+ * table outside the tree. Arguments and codes are those of the copies; what is pending doesn't keep a table from being
+ * moved in memory. */
+kt_int32_t rg_move_table_by_handle_1(rg_opaque_handle_t table_handle, kt_char_ptr_t p_target_table_name,
+                                     kt_int32_t overwrite);
+kt_int32_t rg_move_table_by_name_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_source_table_name,
+                                   kt_char_ptr_t p_target_table_name, kt_int32_t overwrite);
+
 /* Removes the stray rewrite files that a crash can leave beside tables with files. No table is looked into, and none
  * needs to exist. A rewrite that is under way, in any process, loses its file by this and fails when it would be
  * renamed: call it when nobody writes.
@@ -874,6 +931,33 @@ kt_int32_t rg_i_free_directory_list_compat(rg_entry_metadata_t * entry_list, kt_
 /* Do nothing, and return 0. */
 kt_int32_t rg_i_create_directory_compat(void);
 kt_int32_t rg_i_delete_directory_compat(void);
+
+/* ---- Dumps for a person who hunts a fault ----------------------------------------------------------------------
+ *
+ * Outside the numbered interface: no lock is taken, no trace made, no error record set, and the lines may change. Keep
+ * what is dumped still meanwhile: a row that goes away under a dump may take the process with it. */
+
+struct rg_i_table_struct_t; /* a table's handle is the address of one */
+struct rg_i_tree_struct_t;  /* and a tree's that of one of these */
+
+/* Prints the inner state of a table. Printing the file's path (bit value 4194304) leaves a trace in the table: the path
+ * buffer stands at the data file's name afterwards.
+ *
+ *   p_table       the table; NULL ends the dump after its first line
+ *   p_stream      flushed after each item
+ *   detail_flags  what to print, by bits: 1 name, 2 references, 4 number of columns, 8 to 1024 the parts of each
+ *                 column, 2048 row counters, 4096 rows, 8192 their applied and 16384 their committed records, 32768
+ *                 pointers, 65536 the application's data, 131072 to 4194304 the other fields, 8388608 the record
+ *                 pool. All ones print everything, 0 nothing
+ *
+ * Returns 0. See docs/ARCHITECTURE.md. */
+kt_int32_t rg_i_dump_table(struct rg_i_table_struct_t * p_table, FILE * p_stream, kt_uint64_t detail_flags);
+/* Prints a tree, all of its tables with everything in them, and its mount points to standard output.
+ *
+ *   p_tree  the tree; NULL ends the dump after its first line
+ *
+ * Returns 0. */
+kt_int32_t rg_i_dump_tree(struct rg_i_tree_struct_t * p_tree);
 
 #pragma GCC visibility pop
 #ifdef __cplusplus

@@ -55,6 +55,7 @@ static_assert(offsetof(rg_i_record_metadata_t, p_next) == 4 && offsetof(rg_i_rec
 static_assert(std::is_trivially_copyable_v<rg_i_record_metadata_t>);
 
 struct rg_i_free_record_index_t; // leads to a place in the free chain without walking it
+struct rg_i_kept_blocks_t;       // blocks that live as long as somebody needs them
 
 // A pool of zero bytes is an empty pool.
 struct rg_i_record_buffer_pool_t {
@@ -64,6 +65,9 @@ struct rg_i_record_buffer_pool_t {
     rg_i_record_buffer_t *     p_first_record_buffer; // first block
     rg_i_record_buffer_t *     p_last_record_buffer;  // last block
     rg_i_free_record_index_t * p_free_index;          // stands behind the first block; NULL while the pool has no block
+    rg_i_kept_blocks_t *       p_kept_blocks;         // what shares the blocks with pools that lead into them, or NULL
+    rg_i_kept_blocks_t *       p_lender;              // the blocks that records of this pool lead into, or NULL
+    kt_char_ptr_t              p_lent_metadata;       // the metadata record there that the names of this one lie in
 };
 
 static_assert(offsetof(rg_i_record_buffer_pool_t, p_free_chain) == 8 &&
@@ -77,6 +81,7 @@ struct rg_i_record_buffer_pool_duplication_map_t {
     kt_int32_t *    p_offset;     // destination minus source, cut to 32 bits
     kt_char_ptr_t * p_to;         // where each block's first byte went: right at any distance
     kt_uint32_t *   p_by_address; // numbers of the blocks in ascending address order
+    kt_uint32_t     recent;       // the block that an address was last found in
 };
 
 [[nodiscard]] inline rg_i_record_metadata_t * rg_i_record_head(kt_char_ptr_t p_data)
@@ -134,3 +139,18 @@ void rg_i_rb_give_back_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, 
 kt_char_ptr_t rg_i_rb_map_duplicated_address(rg_i_record_buffer_pool_duplication_map_t * p_duplication_map,
                                              kt_char_ptr_t                               p_from);
 kt_int32_t    rg_i_rb_free_duplication_map(rg_i_record_buffer_pool_duplication_map_t * p_duplication_map);
+
+// ---- Blocks that others lead into ----
+//
+// The records of a table copied in memory lead into records of its source. So the pool of the source shares its blocks:
+// they live until the pool is gone and every holder has let go of them. Counts change from any thread.
+
+// Counts one more holder of the pool's blocks. Failure: RG_E_NO_MEMORY, and nothing changed.
+[[nodiscard]] kt_int32_t rg_i_rb_share_blocks(rg_i_record_buffer_pool_t * p_record_buffer_pool,
+                                              rg_i_kept_blocks_t **       p_p_kept_blocks);
+// One more holder of blocks that are shared already.
+void rg_i_rb_hold_blocks(rg_i_kept_blocks_t * p_kept_blocks);
+// NULL is accepted.
+void rg_i_rb_let_go_of_blocks(rg_i_kept_blocks_t * p_kept_blocks);
+// What becomes of the blocks of a pool that goes: freed, or left to those who hold them.
+void rg_i_rb_give_up_blocks(rg_i_record_buffer_pool_t * p_record_buffer_pool);

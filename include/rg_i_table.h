@@ -152,6 +152,22 @@ inline void rg_i_store_u32(void * p, kt_uint32_t word)
 // indirect one. NULL if the stored anchor leaves the record, or what it leads to isn't a whole key: a damaged record.
 [[nodiscard]] kt_char_ptr_t rg_i_row_key(const rg_i_table_t * p_table, kt_char_ptr_t p_record_data);
 
+// Bytes of a whole key at the place that rg_i_row_key tells.
+[[nodiscard]] inline kt_uint32_t rg_i_key_length(kt_data_type_t key_type, const kt_char_t * p_key)
+{
+    if (key_type == KT_CHAR_PTR)
+        return static_cast<kt_uint32_t>(std::strlen(p_key) + 1);
+    return key_type == KT_RSRC_HANDLE_PTR ? sizeof(kt_resource_handle_t) : sizeof(kt_pmsg_value_t);
+}
+
+// The data of the metadata record that the table's names and packed definitions lie in: its own, or that of the table
+// which it, or what it was copied from, was copied from in memory. The two records are laid out alike.
+[[nodiscard]] inline kt_char_ptr_t rg_i_names_record_data(const rg_i_table_t * p_table)
+{
+    kt_char_ptr_t p_lent = p_table->record_buffer_pool.p_lent_metadata;
+    return p_lent != nullptr ? p_lent : p_table->p_metadata_record_data;
+}
+
 // The default data area: the bytes behind the last column, and how many there are.
 [[nodiscard]] kt_char_ptr_t rg_i_default_data(const rg_i_table_t * p_table);
 [[nodiscard]] kt_uint32_t   rg_i_default_data_length(const rg_i_table_t * p_table);
@@ -225,8 +241,11 @@ void rg_i_dup_nonscalar_value(kt_data_type_t type, kt_value_t * p_from_value, kt
 void                      rg_i_swap_columns(rg_column_t * p_column1, rg_column_t * p_column2);
 [[nodiscard]] kt_int32_t  rg_i_convert_metadata_memory_record_to_disk_record(kt_char_ptr_t   p_mem_record,
                                                                              kt_char_ptr_t * p_p_disk_metadata_record);
-void                      rg_i_convert_columns_pointers_to_offsets(rg_i_table_t * p_table);
-void                      rg_i_convert_columns_offsets_to_pointers(rg_i_table_t * p_table);
+// The same for a table that may have its names in the record of the table that it was copied from.
+[[nodiscard]] kt_int32_t rg_i_convert_metadata_to_disk_record(const rg_i_table_t * p_table,
+                                                              kt_char_ptr_t *      p_p_disk_metadata_record);
+void                     rg_i_convert_columns_pointers_to_offsets(rg_i_table_t * p_table);
+void                     rg_i_convert_columns_offsets_to_pointers(rg_i_table_t * p_table);
 // Makes the pool hold room for a hundred rows of a guessed size; takes nothing.
 [[nodiscard]] kt_int32_t rg_i_reserve_room_for_rows(rg_i_table_t * p_table);
 kt_int32_t               rg_i_close_table(rg_i_table_t * p_table);

@@ -275,11 +275,7 @@ kt_int32_t rg_i_rb_initialize_record_buffer_pool(kt_uint32_t                 tot
 kt_int32_t rg_i_rb_uninitialize_record_buffer_pool(rg_i_record_buffer_pool_t * p_record_buffer_pool)
 {
     rg_i_drop_index(p_record_buffer_pool->p_free_index);
-    for (block_t * p_block = p_record_buffer_pool->p_first_record_buffer; p_block != nullptr;) {
-        block_t * const p_next = p_block->p_next;
-        std::free(p_block);
-        p_block = p_next;
-    }
+    rg_i_rb_give_up_blocks(p_record_buffer_pool);
     *p_record_buffer_pool = {};
     return 0;
 }
@@ -423,7 +419,13 @@ kt_int32_t rg_i_rb_duplicate_record_buffer_pool(rg_i_record_buffer_pool_t * p_fr
 kt_char_ptr_t rg_i_rb_map_duplicated_address(rg_i_record_buffer_pool_duplication_map_t * p_duplication_map,
                                              kt_char_ptr_t                               p_from)
 {
-    const map_t &             map     = *p_duplication_map;
+    map_t &    map       = *p_duplication_map;
+    const auto mapped_in = [&map, p_from](kt_uint32_t block) {
+        return map.p_to[block] + (p_from - map.p_begin[block]);
+    };
+    // Rows that follow each other mostly lie in one block.
+    if (map.recent < map.total && p_from >= map.p_begin[map.recent] && p_from < map.p_end[map.recent])
+        return mapped_in(map.recent);
     const kt_uint32_t * const p_order = map.p_by_address;
     // The first block that begins behind the address: the one before it is the only one that can hold it.
     const kt_uint32_t * const p_behind =
@@ -432,7 +434,10 @@ kt_char_ptr_t rg_i_rb_map_duplicated_address(rg_i_record_buffer_pool_duplication
     if (p_behind == p_order)
         return nullptr;
     const kt_uint32_t i = p_behind[-1];
-    return p_from < map.p_end[i] ? map.p_to[i] + (p_from - map.p_begin[i]) : nullptr;
+    if (p_from >= map.p_end[i])
+        return nullptr;
+    map.recent = i;
+    return mapped_in(i);
 }
 
 kt_int32_t rg_i_rb_free_duplication_map(rg_i_record_buffer_pool_duplication_map_t * p_duplication_map)

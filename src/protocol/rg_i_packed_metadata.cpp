@@ -129,8 +129,8 @@ constexpr kt_uint32_t walk_start = 8;
     // The pointer in the record leads to the packed form, which is at any alignment.
     auto * const      p_definition     = reinterpret_cast<kt_char_ptr_t>(column.sd_defn);
     const kt_uint32_t number_of_fields = rg_i_load_u32(p_definition);
-    definition_walk_t walk{p_definition + walk_start,
-                           p_table->p_metadata_record_data + rg_i_record_data_length(p_table->p_metadata_record_data)};
+    kt_char_ptr_t     p_record         = rg_i_names_record_data(p_table);
+    definition_walk_t walk{p_definition + walk_start, p_record + rg_i_record_data_length(p_record)};
     set_uint32(&p_elements[RG_I_PACKED_COLUMN_FIELDS], number_of_fields);
     p_elements[RG_I_PACKED_COLUMN_FIELD_TYPES].data_type = KT_UINT32_ARRAY;
     p_elements[RG_I_PACKED_COLUMN_FIELD_NAMES].data_type = KT_CHAR_PTR_ARRAY;

@@ -19,19 +19,6 @@ namespace
 
 constexpr char module_version[] = "rg_i_delete_rows 1.0";
 
-// Bytes of a whole key at the given place.
-[[nodiscard]] kt_uint32_t key_length(kt_data_type_t key_type, const kt_char_t * p_key)
-{
-    switch (key_type) {
-    case KT_CHAR_PTR:
-        return static_cast<kt_uint32_t>(std::strlen(p_key) + 1);
-    case KT_RSRC_HANDLE_PTR:
-        return sizeof(kt_resource_handle_t);
-    default:
-        return sizeof(kt_pmsg_value_t);
-    }
-}
-
 // Makes the hash element of a row that was never committed independent of the row's record, which is about to go back
 // to the pool: until commit or abort a lookup still finds the key, and an add of it revives the slot.
 [[nodiscard]] kt_int32_t keep_key_of_added_row(rg_i_table_t * p_table, rg_i_index_entry_t * p_index_entry)
@@ -39,7 +26,7 @@ constexpr char module_version[] = "rg_i_delete_rows 1.0";
     if (p_table->p_rows_hash_table == nullptr || p_index_entry->p_committed != nullptr)
         return 0;
     rg_hash_table_element_t * p_element = p_index_entry->p_hash_table_element;
-    const kt_uint32_t         length    = key_length(p_table->p_columns[0].type, p_element->p_key_value);
+    const kt_uint32_t         length    = rg_i_key_length(p_table->p_columns[0].type, p_element->p_key_value);
     if (const kt_int32_t rc =
             rg_i_hash_table_own_key(p_table->p_rows_hash_table, p_index_entry->hash_index, length, &p_element);
         rc != 0)

@@ -20,7 +20,9 @@
 #include "rg_i_table.h"
 #include "storage/rg_i_disk_format.h"
 #include "storage/rg_i_files.h"
+#include "storage/rg_i_gathering_writer.h"
 #include "storage/rg_i_table_file.h"
+#include "storage/rg_i_table_image.h"
 
 namespace
 {
@@ -56,40 +58,6 @@ void trace_exit(const apply_t & apply)
                            table.rewrite_file_length, table.file_fd, table.rewrite_file_fd, apply.rewrite);
 }
 
-// ---- Gathering ----
-
-// Collects records that stand one behind the other in the file, and writes them RG_I_IO_VECTOR_ELEMENTS at a time. What
-// is queued must stay where it is until it is written.
-struct gathering_writer_t {
-    struct iovec * p_vector;
-    kt_int32_t     fd;
-    kt_uint32_t    file_offset; // where the next record goes
-    kt_uint32_t    elements = 0;
-    ssize_t        bytes    = 0; // queued
-    kt_uint32_t    written  = 0;
-};
-
-void queue(gathering_writer_t & writer, kt_char_ptr_t p_record, kt_uint32_t record_length)
-{
-    writer.p_vector[writer.elements] = {p_record, record_length};
-    ++writer.elements;
-    writer.bytes += record_length;
-    writer.file_offset += record_length;
-}
-
-[[nodiscard]] kt_int32_t write_queued(gathering_writer_t & writer)
-{
-    const kt_int32_t rc = rg_i_writev(writer.fd, writer.p_vector, writer.elements, writer.bytes, &writer.written);
-    writer.elements     = 0;
-    writer.bytes        = 0;
-    return rc;
-}
-
-[[nodiscard]] kt_int32_t write_if_full(gathering_writer_t & writer)
-{
-    return writer.elements == RG_I_IO_VECTOR_ELEMENTS ? write_queued(writer) : 0;
-}
-
 // ---- The rows that go out ----
 
 // Runs an action for the index entry of each row that this apply writes: in a rewrite every row that has an applied
@@ -98,18 +66,8 @@ void queue(gathering_writer_t & writer, kt_char_ptr_t p_record, kt_uint32_t reco
 template <class Action> [[nodiscard]] kt_int32_t for_each_written_row(const apply_t & apply, Action action)
 {
     rg_i_table_t & table = apply.table;
-    if (apply.rewrite != 0) {
-        kt_uint32_t rows_to_write = table.total_applied_rows - table.applied_deletions;
-        for (kt_uint32_t slot = 0; rows_to_write > 0 && slot < table.maximum_rows; ++slot) {
-            rg_i_index_entry_t & entry = table.p_rows_fixed_index[slot];
-            if (entry.p_applied == nullptr)
-                continue;
-            --rows_to_write;
-            if (const kt_int32_t rc = action(entry); rc != 0)
-                return rc;
-        }
-        return 0;
-    }
+    if (apply.rewrite != 0)
+        return rg_i_for_each_applied_row(table, action);
     for (rg_i_change_entry_t * p_change = table.p_rows_change_list; p_change != nullptr; p_change = p_change->p_next) {
         rg_i_index_entry_t & entry = *p_change->p_index_entry;
         if (entry.p_applied == nullptr)
@@ -120,16 +78,11 @@ template <class Action> [[nodiscard]] kt_int32_t for_each_written_row(const appl
     return 0;
 }
 
-[[nodiscard]] kt_uint32_t disk_length_of(const rg_i_index_entry_t & entry)
-{
-    return rg_i_record_head(entry.p_applied)->record_length - RG_I_MEMORY_RECORD_EXCESS;
-}
-
 [[nodiscard]] kt_uint64_t disk_length_of_rows(const apply_t & apply)
 {
     kt_uint64_t length = 0;
     (void)for_each_written_row(apply, [&](const rg_i_index_entry_t & entry) {
-        length += disk_length_of(entry);
+        length += rg_i_disk_length_of(entry.p_applied);
         return 0;
     });
     return length;
@@ -146,43 +99,29 @@ template <class Action> [[nodiscard]] kt_int32_t for_each_written_row(const appl
 void build_row_record(const apply_t & apply, rg_i_index_entry_t & entry, kt_char_ptr_t p_disk_record,
                       kt_uint32_t file_offset)
 {
-    rg_i_record_metadata_t * const p_head        = rg_i_record_head(entry.p_applied);
-    const kt_uint32_t              record_length = disk_length_of(entry);
-    rg_i_store(p_disk_record, rg_i_disk_record_metadata_t{record_length, 0, p_head->type});
-    std::memcpy(p_disk_record + sizeof(rg_i_disk_record_metadata_t), entry.p_applied,
-                record_length - sizeof(rg_i_disk_record_metadata_t));
-    // The data begins with the offset of the version that this one replaces. A rewritten file has one version of each
-    // row, so nothing is replaced there.
-    if (apply.rewrite != 0 && p_head->type == RG_RECORD_TYPE_ROW)
-        rg_i_store_u32(p_disk_record + offsetof(rg_i_disk_row_record_t, replaces_offset), 0);
-
-    p_head->disk_table_offset = file_offset;
-    entry.applied_file_offset = file_offset;
+    rg_i_build_row_record(entry.p_applied, p_disk_record,
+                          apply.rewrite != 0 ? row_record::stands_alone : row_record::keeps_replaces_offset);
+    rg_i_record_head(entry.p_applied)->disk_table_offset = file_offset;
+    entry.applied_file_offset                            = file_offset;
 }
 
-[[nodiscard]] kt_int32_t write_rows(const apply_t & apply, gathering_writer_t & writer)
+[[nodiscard]] kt_int32_t write_rows(const apply_t & apply, rg_i_gathering_writer_t & writer)
 {
     kt_char_ptr_t p_disk_record = apply.rows.get();
     return for_each_written_row(apply, [&](rg_i_index_entry_t & entry) {
-        const kt_uint32_t record_length = disk_length_of(entry);
+        const kt_uint32_t record_length = rg_i_disk_length_of(entry.p_applied);
         build_row_record(apply, entry, p_disk_record, writer.file_offset);
-        queue(writer, p_disk_record, record_length);
+        rg_i_queue(writer, p_disk_record, record_length);
         p_disk_record += record_length;
-        return write_if_full(writer);
+        return rg_i_write_if_full(writer);
     });
 }
 
 // Ends the group. The commit record goes out with what is queued.
-[[nodiscard]] kt_int32_t write_commit_record(const apply_t & apply, gathering_writer_t & writer)
+[[nodiscard]] kt_int32_t write_commit_record(const apply_t & apply, rg_i_gathering_writer_t & writer)
 {
-    queue(writer, apply.commit_record.get(), apply.table.disk_applied_commit_record_length);
-    return write_queued(writer);
-}
-
-// Offsets and lengths in a file are 32 bits wide, and no apply may write a file that they can't tell.
-[[nodiscard]] bool outgrows_offsets(kt_uint64_t file_length)
-{
-    return file_length > UINT32_MAX;
+    rg_i_queue(writer, apply.commit_record.get(), apply.table.disk_applied_commit_record_length);
+    return rg_i_write_queued(writer);
 }
 
 // ---- Rewriting ----
@@ -215,20 +154,18 @@ void build_row_record(const apply_t & apply, rg_i_index_entry_t & entry, kt_char
     if (lockf(table.rewrite_file_fd, F_LOCK, 0) != 0)
         return leave(apply, __LINE__, rg_i_fail_system_call(RG_HERE, "lockf", errno));
 
-    if (const kt_int32_t rc = rg_i_convert_metadata_memory_record_to_disk_record(
-            reinterpret_cast<kt_char_ptr_t>(rg_i_record_head(table.p_metadata_record_data)), apply.disk_metadata.out());
-        rc != 0)
+    if (const kt_int32_t rc = rg_i_convert_metadata_to_disk_record(&table, apply.disk_metadata.out()); rc != 0)
         return leave(apply, __LINE__, rc);
 
     const kt_uint32_t metadata_length = rg_i_load_u32(apply.disk_metadata.get());
     const kt_uint64_t rows_length     = disk_length_of_rows(apply);
-    if (outgrows_offsets(metadata_length + rows_length + table.disk_applied_commit_record_length))
+    if (rg_i_outgrows_offsets(metadata_length + rows_length + table.disk_applied_commit_record_length))
         return leave(apply, __LINE__, rg_i_fail_system_call(RG_HERE, "writev", EFBIG));
     if (!allocate_rows(apply, rows_length))
         return leave(apply, __LINE__, rg_i_fail_no_memory(RG_HERE));
 
-    gathering_writer_t writer{table.io_vector, table.rewrite_file_fd, 0};
-    queue(writer, apply.disk_metadata.get(), metadata_length);
+    rg_i_gathering_writer_t writer{table.io_vector, table.rewrite_file_fd, 0};
+    rg_i_queue(writer, apply.disk_metadata.get(), metadata_length);
     if (const kt_int32_t rc = write_rows(apply, writer); rc != 0)
         return leave(apply, __LINE__, full_is_reported(table, rc));
     const kt_uint32_t commit_record_offset = writer.file_offset;
@@ -291,14 +228,14 @@ void build_deleted_rows_record(const apply_t & apply, kt_uint32_t count)
 }
 
 // At most one a transaction, behind all rows.
-[[nodiscard]] kt_int32_t write_deleted_rows(apply_t & apply, gathering_writer_t & writer, kt_uint32_t count)
+[[nodiscard]] kt_int32_t write_deleted_rows(apply_t & apply, rg_i_gathering_writer_t & writer, kt_uint32_t count)
 {
     apply.deleted_rows.reset(static_cast<kt_char_ptr_t>(std::malloc(deleted_rows_length(count))));
     if (!apply.deleted_rows)
         return leave(apply, __LINE__, rg_i_fail_no_memory(RG_HERE));
     build_deleted_rows_record(apply, count);
-    queue(writer, apply.deleted_rows.get(), static_cast<kt_uint32_t>(deleted_rows_length(count)));
-    if (const kt_int32_t rc = write_if_full(writer); rc != 0)
+    rg_i_queue(writer, apply.deleted_rows.get(), static_cast<kt_uint32_t>(deleted_rows_length(count)));
+    if (const kt_int32_t rc = rg_i_write_if_full(writer); rc != 0)
         return leave(apply, __LINE__, rc);
     return 0;
 }
@@ -312,11 +249,11 @@ void build_deleted_rows_record(const apply_t & apply, kt_uint32_t count)
 
     const kt_uint64_t rows_length   = disk_length_of_rows(apply);
     const kt_uint32_t deleted_count = count_deleted_rows(table);
-    if (outgrows_offsets(start + rows_length + deleted_rows_length(deleted_count) +
-                         table.disk_applied_commit_record_length))
+    if (rg_i_outgrows_offsets(start + rows_length + deleted_rows_length(deleted_count) +
+                              table.disk_applied_commit_record_length))
         return leave(apply, __LINE__, rg_i_fail_system_call(RG_HERE, "writev", EFBIG));
 
-    gathering_writer_t writer{table.io_vector, table.file_fd, static_cast<kt_uint32_t>(start)};
+    rg_i_gathering_writer_t writer{table.io_vector, table.file_fd, static_cast<kt_uint32_t>(start)};
     if (table.p_rows_change_list != nullptr) {
         if (!allocate_rows(apply, rows_length)) {
             // Kept because callers depend on it: an append that gets no memory for its rows takes a stale rewrite file

@@ -421,8 +421,12 @@ kt_int32_t rg_i_create_transient_table(rg_i_tree_t * p_tree, kt_char_ptr_t p_nam
 
 // ---- The metadata record in other forms ----
 
-kt_int32_t rg_i_convert_metadata_memory_record_to_disk_record(kt_char_ptr_t   p_mem_record,
-                                                              kt_char_ptr_t * p_p_disk_metadata_record)
+namespace
+{
+
+// The names lie behind the columns of the record p_names_data, which is laid out like the one that is converted.
+[[nodiscard]] kt_int32_t convert_metadata(kt_char_ptr_t p_mem_record, kt_char_ptr_t p_names_data,
+                                          kt_char_ptr_t * p_p_disk_metadata_record)
 {
     const kt_uint32_t mem_length = rg_i_load<rg_i_record_metadata_t>(p_mem_record).record_length;
     kt_char_ptr_t     p_mem_data = p_mem_record + RG_I_RECORD_HEAD_LENGTH;
@@ -435,15 +439,30 @@ kt_int32_t rg_i_convert_metadata_memory_record_to_disk_record(kt_char_ptr_t   p_
         return rg_i_fail_no_memory(RG_HERE);
     rg_i_store(p_disk_record, rg_i_disk_metadata_record_t{{disk_length, 0, RG_RECORD_TYPE_METADATA}, head});
 
-    const auto *  p_columns = reinterpret_cast<const rg_column_t *>(p_mem_data + metadata_head_length);
-    const auto *  p_region  = reinterpret_cast<const kt_char_t *>(p_columns + head.total_columns);
-    kt_char_ptr_t p_to      = p_disk_record + sizeof(rg_i_disk_metadata_record_t);
+    const auto *  p_columns      = reinterpret_cast<const rg_column_t *>(p_mem_data + metadata_head_length);
+    const auto *  p_region       = reinterpret_cast<const kt_char_t *>(p_columns + head.total_columns);
+    const auto *  p_names_region = p_names_data + (p_region - p_mem_data);
+    kt_char_ptr_t p_to           = p_disk_record + sizeof(rg_i_disk_metadata_record_t);
     for (kt_uint32_t column = 0; column < head.total_columns; ++column, p_to += sizeof(rg_disk_column_t))
-        rg_i_store(p_to, disk_column(p_columns[column], p_region));
+        rg_i_store(p_to, disk_column(p_columns[column], p_names_region));
     // Behind the columns the two forms are byte for byte the same, the spare zeros at the end included.
     std::memcpy(p_to, p_region, static_cast<size_t>(p_disk_record + disk_length - p_to));
     *p_p_disk_metadata_record = p_disk_record;
     return 0;
+}
+
+} // namespace
+
+kt_int32_t rg_i_convert_metadata_memory_record_to_disk_record(kt_char_ptr_t   p_mem_record,
+                                                              kt_char_ptr_t * p_p_disk_metadata_record)
+{
+    return convert_metadata(p_mem_record, p_mem_record + RG_I_RECORD_HEAD_LENGTH, p_p_disk_metadata_record);
+}
+
+kt_int32_t rg_i_convert_metadata_to_disk_record(const rg_i_table_t * p_table, kt_char_ptr_t * p_p_disk_metadata_record)
+{
+    return convert_metadata(p_table->p_metadata_record_data - RG_I_RECORD_HEAD_LENGTH, rg_i_names_record_data(p_table),
+                            p_p_disk_metadata_record);
 }
 
 // The two below stand ready for moving a metadata record.

@@ -16,6 +16,7 @@
 
 #include "frame/rg_i_trace.h"
 #include "rg_i_free_slot_index.h"
+#include "storage/rg_i_disk_format.h"
 
 namespace
 {
@@ -173,8 +174,10 @@ kt_uint32_t rg_i_default_data_length(const rg_i_table_t * p_table)
 {
     if (p_table->total_columns == 0)
         return 0;
-    // The first name stands directly behind the default data.
-    return static_cast<kt_uint32_t>(p_table->p_columns[0].name - rg_i_default_data(p_table));
+    // The first name stands directly behind the default data of the record that it lies in.
+    const kt_char_t * const p_behind_columns = rg_i_names_record_data(p_table) + sizeof(rg_i_metadata_head_t) +
+                                               p_table->total_columns * sizeof(rg_column_t);
+    return static_cast<kt_uint32_t>(p_table->p_columns[0].name - p_behind_columns);
 }
 
 void rg_i_dup_nonscalar_value(kt_data_type_t type, kt_value_t * p_from_value, kt_value_t * p_to_value)

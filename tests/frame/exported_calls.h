@@ -42,6 +42,8 @@ inline const std::vector<exported_call> & all_calls()
         {"rg_close_table_1", 13, false, [](handle_t h) { return rg_close_table_1(h); }},
         {"rg_close_tree_1", 15, false, [](handle_t h) { return rg_close_tree_1(h); }},
         {"rg_commit_1", 17, true, [](handle_t h) { return rg_commit_1(h); }},
+        {"rg_copy_table_by_handle_1", 19, true, [](handle_t h) { return rg_copy_table_by_handle_1(h, path, 0); }},
+        {"rg_copy_table_by_name_1", 21, true, [](handle_t h) { return rg_copy_table_by_name_1(h, path, path, 0); }},
         {"rg_create_table_1", 23, true, [](handle_t h) { return rg_create_table_1(h, path, &key, 1, 2, &result); }},
         {"rg_create_hashed_key_table_1", 25, true,
          [](handle_t h) {
@@ -71,6 +73,8 @@ inline const std::vector<exported_call> & all_calls()
          [](handle_t h) { return rg_get_fields_by_key_and_visibility_1(h, value, &name, &values, 1, 0, &state); }},
         {"rg_list_tables_1", 69, false, [](handle_t h) { return rg_list_tables_1(h, path, &p_list, &index); }},
         {"rg_mount_local_tree_1", 71, true, [](handle_t h) { return rg_mount_local_tree_1(h, path, dir, 1); }},
+        {"rg_move_table_by_handle_1", 73, true, [](handle_t h) { return rg_move_table_by_handle_1(h, path, 0); }},
+        {"rg_move_table_by_name_1", 75, true, [](handle_t h) { return rg_move_table_by_name_1(h, path, path, 0); }},
         {"rg_open_table_1", 77, false, [](handle_t h) { return rg_open_table_1(h, path, 2, &result); }},
         {"rg_open_hashed_key_table_1", 79, false,
          [](handle_t h) { return rg_open_hashed_key_table_1(h, path, 2, 8, hash_uint32, compare_uint32, &result); }},
