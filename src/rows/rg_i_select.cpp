@@ -87,15 +87,16 @@ constexpr kt_uint32_t result_mode = RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL;
     // Nothing below fails.
     auto *            p_columns      = reinterpret_cast<rg_column_t *>(p_to + metadata_head_length);
     const kt_char_t * p_from_data    = rg_i_default_data(p_table);
+    const kt_char_t * p_from_names   = rg_i_names_record_data(p_table) + metadata_head_length + from_columns;
     kt_char_ptr_t     p_to_data      = p_to + metadata_head_length + to_columns;
     kt_uint32_t       total_indirect = 0;
     std::memcpy(p_to_data, p_from_data, behind);
     for (kt_uint32_t i = 0; i < total_select_columns; ++i) {
         rg_column_t definition = p_table->p_columns[p_column_indices != nullptr ? p_column_indices[i] : i];
-        definition.name        = p_to_data + (definition.name - p_from_data);
+        definition.name        = p_to_data + (definition.name - p_from_names);
         if (definition.sd_defn != nullptr)
             definition.sd_defn = reinterpret_cast<rg_sd_def_t *>(
-                p_to_data + (reinterpret_cast<const kt_char_t *>(definition.sd_defn) - p_from_data));
+                p_to_data + (reinterpret_cast<const kt_char_t *>(definition.sd_defn) - p_from_names));
         if (rg_i_type_is_indirect(definition.type))
             ++total_indirect;
         std::memcpy(static_cast<void *>(&p_columns[i]), &definition, sizeof definition);
