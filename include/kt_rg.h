@@ -220,21 +220,27 @@ kt_int32_t rg_unmount_local_tree_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t
  *   RG_E_INVALID_PATH      the path can't be one
  *   RG_E_TABLE_EXISTS      the table is in the tree, its file exists, or it can't be told whether it does
  *   RG_E_NO_COLUMNS        array_count is 0
- *   RG_E_INVALID_COLUMN    a name that isn't a letter and up to 254 letters, digits and '_'; a type or qualifier that
- * no column can have; structured data without a definition or with a nameless field; a key of a type that no key can
- * have RG_E_KEY_EXPECTED      no key column RG_E_DUPLICATE_KEY     more than one key column RG_E_DUPLICATE_COLUMN  two
- * columns of one name RG_E_LIBRARY_CALL      a default can't be stored: a string that the table's encoding lacks, or a
- * broken record RG_E_NO_MEMORY         no memory. If it ran out behind the last step of a table with a file, the file
- * is there RG_E_ACCESS            no permission to make the file RG_E_FILESYSTEM_FULL_DETAIL, RG_E_SYSTEM_CALL  the
- * file could not be written RG_E_INTERNAL          in a forked child, without an error record Thread-safe; creations
- * and updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/FILE-FORMAT.md, docs/BAD-INPUT.md. */
+ *   RG_E_INVALID_COLUMN    a name that isn't a letter and up to 254 letters, digits and '_'; a type or qualifier that no
+ *                          column can have; structured data without a definition or with a nameless field; a key of a
+ *                          type that no key can have
+ *   RG_E_KEY_EXPECTED      no key column
+ *   RG_E_DUPLICATE_KEY     more than one key column
+ *   RG_E_DUPLICATE_COLUMN  two columns of one name
+ *   RG_E_LIBRARY_CALL      a default can't be stored: a string that the table's encoding lacks, or a broken record
+ *   RG_E_NO_MEMORY         no memory. If it ran out behind the last step of a table with a file, the file is there
+ *   RG_E_ACCESS            no permission to make the file
+ *   RG_E_FILESYSTEM_FULL_DETAIL, RG_E_SYSTEM_CALL  the file could not be written
+ *   RG_E_INTERNAL          in a forked child, without an error record
+ * Thread-safe; creations and updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/FILE-FORMAT.md,
+ * docs/BAD-INPUT.md. */
 kt_int32_t rg_create_table_1(rg_opaque_handle_t tree_handle, kt_char_ptr_t p_registry_path, rg_column_t * p_columns,
                              kt_uint32_t array_count, kt_int32_t mode, rg_opaque_handle_t * p_result_table_handle);
 /* The same, for a table whose rows are found by key through a hash table. A table keyed by resource handle has one
  * without this call.
  *
- *   total_hash_buckets  fixed while the table is open; not 0. The hash table isn't part of a file: rg_open_table_1
- * opens the table without one p_hash_function     gives the bucket of a key, below total_hash_buckets
+ *   total_hash_buckets  fixed while the table is open; not 0. The hash table isn't part of a file: rg_open_table_1 opens
+ *                       the table without one
+ *   p_hash_function     gives the bucket of a key, below total_hash_buckets
  *   p_compare_function  0 if two keys are equal
  *
  * The two functions are called with the table locked, so they must not call the library on that table; the address of

@@ -2,10 +2,11 @@
 // rg_i_table_from_packed_rows: puts the rows of a packed table under a new table object, without copying them.
 //
 // Layer: protocol. Called by rg_x_create_table. The columns go the way of any new table; the rows stay in the array
-// that was made of the buffer, whose elements look like records of the pool to everybody who reads them. Always holds:
-// a row's own length word, which bounds every later read of the row, has been held against the columns before the row
-// is entered. Values aren't looked at here, but for the key. Locking: nobody else can see the table yet; the caller
-// holds the tree's write lock. Failure: no table. The array stays the caller's, the hash table is closed.
+// that was made of the buffer, whose elements look like records of the pool to everybody who reads them.
+// Always holds: a row's own length word, which bounds every later read of the row, has been held against the columns
+// before the row is entered. Values aren't looked at here, but for the key.
+// Locking: nobody else can see the table yet; the caller holds the tree's write lock.
+// Failure: no table. The array stays the caller's, the hash table is closed.
 #include <cstdlib>
 
 #include "frame/rg_i_trace.h"

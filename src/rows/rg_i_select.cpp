@@ -5,7 +5,8 @@
 // Always holds: the source isn't changed and nothing is shared with it but the tree. The result's rows stand from fixed
 // index 0 on in the order of the source's slots; each has one record, which is both its applied and its committed one.
 // Locking: the caller holds the source's lock for reading, and the tree's for writing; the result is seen by nobody
-// yet. Failure: nothing is left of the result.
+// yet.
+// Failure: nothing is left of the result.
 #include <cstdlib>
 #include <cstring>
 

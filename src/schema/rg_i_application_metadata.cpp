@@ -3,8 +3,9 @@
 // rows.
 //
 // Layer: schema. Called by the creation, opening and closing of tables, by apply, commit and abort, and by the two
-// calls of the interface, which use element type 0 alone. Always holds: the index ascends by type. An element without a
-// pending change has both pointers at one version. Locking: the table's lock: write for changes, read for getting.
+// calls of the interface, which use element type 0 alone.
+// Always holds: the index ascends by type. An element without a pending change has both pointers at one version.
+// Locking: the table's lock: write for changes, read for getting.
 // Failure: a new version is made before anything else changes; the set is as it was.
 #include "rg_i_application_metadata.h"
 

@@ -3,9 +3,10 @@
 //
 // Layer: whole. Called by deletions and moves.
 // Always holds: the file goes first, and only if it went does the rewrite file follow, with the outcome ignored.
-// Objects aren't closed: handles may still lead to them. Locking: the caller holds the write lock of the table's tree.
-// No file lock is taken: a process that has the table open goes on working on the removed file. Failure: the table is
-// still in its tree, and its file where it was.
+// Objects aren't closed: handles may still lead to them.
+// Locking: the caller holds the write lock of the table's tree. No file lock is taken: a process that has the table
+// open goes on working on the removed file.
+// Failure: the table is still in its tree, and its file where it was.
 #include "whole/rg_i_remove_table.h"
 
 #include <search.h>
