@@ -7,7 +7,7 @@
 #include "program.h"
 
 using ktrg_test::result;
-using ktrg_test::workplace;
+using ktrg_test::scratch;
 
 namespace
 {
@@ -16,7 +16,7 @@ const char * const hosts = "name,load,cpus\nalpha,0.25,4\nbeta,1.5,16\n";
 
 TEST(importing, makes_a_table_with_types_that_fit_the_file)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", "name,load,cpus,big,zip,note\nalpha,0.25,4,18446744073709551615,01234,x\n"
                           "beta,2,-16,1,99999,\n");
     ASSERT_EQ(at.run({"import", "hosts", "hosts.csv", "--create", "--key", "name"}).code, 0);
@@ -28,7 +28,7 @@ TEST(importing, makes_a_table_with_types_that_fit_the_file)
 
 TEST(importing, types_that_are_named_are_taken_and_their_defaults_fill_missing_cells)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", "name,load,cpus\nalpha,,4\nbeta,1.5,\n");
     const result made =
         at.run({"import", "hosts", "hosts.csv", "--create", "-k", "name", "--types", "load:float32=0.5,cpus:uint32=1"});
@@ -39,7 +39,7 @@ TEST(importing, types_that_are_named_are_taken_and_their_defaults_fill_missing_c
 
 TEST(importing, the_key_comes_first_whatever_the_order_of_the_file)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", "load,cpus,name\n1.5,2,alpha\n");
     ASSERT_EQ(at.run({"import", "hosts", "hosts.csv", "--create", "--key", "name"}).code, 0);
     EXPECT_EQ(at.run({"schema", "hosts"}).out, "name:string:key\nload:float64\ncpus:int64\n");
@@ -47,7 +47,7 @@ TEST(importing, the_key_comes_first_whatever_the_order_of_the_file)
 
 TEST(importing, without_a_key_option_the_first_column_is_it_and_that_is_told)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", hosts);
     const result made = at.run({"import", "hosts", "hosts.csv", "--create"});
     EXPECT_EQ(made.code, 0);
@@ -56,7 +56,7 @@ TEST(importing, without_a_key_option_the_first_column_is_it_and_that_is_told)
 
 TEST(importing, adds_to_a_table_by_the_names_of_the_header)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", hosts);
     at.write("more.csv", "cpus,name\n2,gamma\n");
     ASSERT_EQ(at.run({"import", "hosts", "hosts.csv", "--create"}).code, 0);
@@ -69,7 +69,7 @@ TEST(importing, adds_to_a_table_by_the_names_of_the_header)
 
 TEST(importing, reads_standard_input_tabs_byte_order_marks_and_carriage_returns)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(at.run({"import", "a", "-", "--create"}, "\xef\xbb\xbfname,n\r\nx,1\r\ny,2\r\n").code, 0);
     EXPECT_EQ(at.run({"select", "a", "-H", "-o", "tsv"}).out, "x\t1\ny\t2\n");
     at.write("b.tsv", "name\tn\nx, y\t1\n");
@@ -79,28 +79,28 @@ TEST(importing, reads_standard_input_tabs_byte_order_marks_and_carriage_returns)
 
 TEST(importing, quotes_commas_and_line_ends_inside_a_cell_are_kept)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(at.run({"import", "a", "-", "--create"}, "name,note\n\"a,b\",\"say \"\"hi\"\"\nand bye\"\n").code, 0);
     EXPECT_EQ(at.run({"select", "a", "-o", "csv"}).out, "name,note\r\n\"a,b\",\"say \"\"hi\"\"\nand bye\"\r\n");
 }
 
 TEST(importing, spaces_are_part_of_a_cell)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(at.run({"import", "a", "-", "--create"}, "name,note\nx,  y \n").code, 0);
     EXPECT_EQ(at.run({"select", "a", "-H", "-o", "csv"}).out, "x,  y \r\n");
 }
 
 TEST(importing, a_file_without_a_header_gets_columns_by_number)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(at.run({"import", "a", "-", "--create", "-H"}, "x,1\ny,2\n").code, 0);
     EXPECT_EQ(at.run({"schema", "a"}).out, "c1:string:key\nc2:int64\n");
 }
 
 TEST(importing, headings_that_no_column_can_have_are_changed_and_told)
 {
-    workplace    at;
+    scratch      at;
     const result made = at.run({"import", "a", "-", "--create"}, "Package,Installed-Size,2nd\nx,1,2\n");
     ASSERT_EQ(made.code, 0);
     EXPECT_EQ(at.run({"schema", "a"}).out, "Package:string:key\nInstalled_Size:int64\nc2nd:int64\n");
@@ -109,14 +109,14 @@ TEST(importing, headings_that_no_column_can_have_are_changed_and_told)
 
 TEST(importing, map_gives_a_column_of_the_file_another_name)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(at.run({"import", "a", "-", "--create", "--map", "Name=id"}, "Name,n\nx,1\n").code, 0);
     EXPECT_EQ(at.run({"schema", "a"}).out, "id:string:key\nn:int64\n");
 }
 
 TEST(importing, arrays_structures_binaries_and_handles_come_as_json_and_go_back_the_same)
 {
-    workplace         at;
+    scratch           at;
     const std::string text = "id,list,where,raw,who,names\r\n"
                              "1,\"[1,-2,3]\",\"{\"\"street\"\":\"\"Elm\"\",\"\"number\"\":7}\",\"\"\"0x00ff\"\"\","
                              "0x0001 0x0002 0x00000003 0x00000004 0x00000005 0x00000006,\"[\"\"a\"\",\"\"b\"\"]\"\r\n";
@@ -139,7 +139,7 @@ TEST(importing, arrays_structures_binaries_and_handles_come_as_json_and_go_back_
 
 TEST(importing, a_value_that_does_not_fit_names_its_line_and_nothing_stays)
 {
-    workplace    at;
+    scratch      at;
     const result made =
         at.run({"import", "a", "-", "--create", "--types", "n:int32"}, "name,n\nx,1\n\"y\nz\",2\nw,3000000000\n");
     EXPECT_EQ(made.code, 2);
@@ -151,7 +151,7 @@ TEST(importing, a_value_that_does_not_fit_names_its_line_and_nothing_stays)
 
 TEST(importing, a_failed_import_leaves_the_file_byte_for_byte_as_it_was)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", hosts);
     ASSERT_EQ(at.run({"import", "hosts", "hosts.csv", "--create"}).code, 0);
     const std::string before = at.read("hosts");
@@ -163,7 +163,7 @@ TEST(importing, a_failed_import_leaves_the_file_byte_for_byte_as_it_was)
 
 TEST(importing, an_unknown_column_is_refused_with_a_near_name)
 {
-    workplace at;
+    scratch at;
     at.write("state/hosts.csv", hosts);
     ASSERT_EQ(at.run({"import", "state/hosts", "state/hosts.csv", "--create"}).code, 0);
     const result added = at.run({"import", "state/hosts", "-"}, "nam,load\nx,1\n");
@@ -173,7 +173,7 @@ TEST(importing, an_unknown_column_is_refused_with_a_near_name)
 
 TEST(importing, a_missing_key_column_or_cell_is_refused)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", hosts);
     ASSERT_EQ(at.run({"import", "hosts", "hosts.csv", "--create"}).code, 0);
     EXPECT_EQ(at.run({"import", "hosts", "-"}, "load\n1\n").code, 2);
@@ -183,7 +183,7 @@ TEST(importing, a_missing_key_column_or_cell_is_refused)
 
 TEST(importing, rows_of_another_width_name_their_line)
 {
-    workplace    at;
+    scratch      at;
     const result made = at.run({"import", "a", "-", "--create"}, "name,n\nx,1\n\ny\n");
     EXPECT_EQ(made.code, 2);
     EXPECT_NE(made.err.find("standard input:4: 1 fields, where the header has 2"), std::string::npos) << made.err;
@@ -192,7 +192,7 @@ TEST(importing, rows_of_another_width_name_their_line)
 
 TEST(importing, broken_quotes_name_their_line)
 {
-    workplace at;
+    scratch at;
     EXPECT_NE(at.run({"import", "a", "-", "--create"}, "name,n\nx\"y,1\n").err.find("standard input:2: not CSV"),
               std::string::npos);
     const result open = at.run({"import", "a", "-", "--create"}, "name,n\nx,1\n\"y,1\n");
@@ -202,7 +202,7 @@ TEST(importing, broken_quotes_name_their_line)
 
 TEST(importing, an_empty_file_and_one_that_is_not_there_are_refused)
 {
-    workplace at;
+    scratch at;
     EXPECT_EQ(at.run({"import", "a", "-", "--create"}, "").code, 2);
     EXPECT_EQ(at.run({"import", "a", "nowhere.csv", "--create"}).code, 3);
     EXPECT_FALSE(at.exists("a"));
@@ -210,14 +210,14 @@ TEST(importing, an_empty_file_and_one_that_is_not_there_are_refused)
 
 TEST(importing, a_header_alone_makes_an_empty_table)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(at.run({"import", "a", "-", "--create"}, "name,n\n").code, 0);
     EXPECT_EQ(at.run({"select", "a", "--count"}).out, "0\n");
 }
 
 TEST(importing, create_refuses_a_table_that_exists_and_plain_import_one_that_does_not)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", hosts);
     ASSERT_EQ(at.run({"import", "hosts", "hosts.csv", "--create"}).code, 0);
     const std::string before = at.read("hosts");
@@ -232,7 +232,7 @@ TEST(importing, create_refuses_a_table_that_exists_and_plain_import_one_that_doe
 
 TEST(importing, a_dry_run_finds_what_is_wrong_and_writes_nothing)
 {
-    workplace at;
+    scratch at;
     at.write("hosts.csv", hosts);
     EXPECT_EQ(at.run({"import", "hosts", "hosts.csv", "--create", "--dry-run"}).code, 0);
     EXPECT_FALSE(at.exists("hosts"));
@@ -245,7 +245,7 @@ TEST(importing, a_dry_run_finds_what_is_wrong_and_writes_nothing)
 
 TEST(importing, types_of_columns_that_the_file_lacks_are_refused)
 {
-    workplace    at;
+    scratch      at;
     const result made = at.run({"import", "a", "-", "--create", "--types", "nam:string"}, "name,n\nx,1\n");
     EXPECT_EQ(made.code, 2);
     EXPECT_NE(made.err.find("no column \"nam\" (did you mean \"name\"?) [105]"), std::string::npos) << made.err;
@@ -256,7 +256,7 @@ TEST(importing, types_of_columns_that_the_file_lacks_are_refused)
 
 TEST(importing, a_directory_that_is_not_there_is_not_made)
 {
-    workplace    at;
+    scratch      at;
     const result made = at.run({"import", "state/a", "-", "--create", "-q"}, "name,n\nx,1\n");
     EXPECT_EQ(made.code, 3);
     EXPECT_EQ(made.err, "ktrg: state/a: no directory \"state\" [200]\n");
@@ -265,8 +265,8 @@ TEST(importing, a_directory_that_is_not_there_is_not_made)
 
 TEST(importing, an_interrupt_ends_it_with_130_and_nothing_stays)
 {
-    workplace                at;
-    const workplace::running import = at.start({"import", "a", "-", "--create"});
+    scratch                at;
+    const scratch::running import = at.start({"import", "a", "-", "--create"});
     ASSERT_GT(write(import.input, "name,n\nx,1\n", 11), 0);
     std::this_thread::sleep_for(std::chrono::milliseconds(300)); // it waits for more input by then
     kill(import.pid, SIGINT);
@@ -277,7 +277,7 @@ TEST(importing, an_interrupt_ends_it_with_130_and_nothing_stays)
 
 TEST(importing, twenty_thousand_rows_come_back_as_they_went_in)
 {
-    workplace   at;
+    scratch     at;
     std::string text = "id,name,ratio\r\n";
     for (int i = 0; i < 20000; i++)
         text += std::to_string(i) + ",name " + std::to_string(i * 7919 % 20000) + "," + std::to_string(i) + ".5\r\n";

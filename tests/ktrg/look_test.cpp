@@ -15,12 +15,12 @@
 #include "program.h"
 
 using ktrg_test::result;
-using ktrg_test::workplace;
+using ktrg_test::scratch;
 
 namespace
 {
 
-void make_hosts(workplace & at, const std::string & table = "hosts")
+void make_hosts(scratch & at, const std::string & table = "hosts")
 {
     const result made =
         at.run({"import", table, "-", "--create"}, "name,load,cpus\nalpha,0.25,4\nbeta,1.5,16\nab,-3,8\n");
@@ -31,7 +31,7 @@ void make_hosts(workplace & at, const std::string & table = "hosts")
 
 TEST(getting, rows_come_in_the_order_of_the_keys)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const result rows = at.run({"get", "hosts", "beta", "alpha", "-o", "csv"});
     EXPECT_EQ(rows.code, 0);
@@ -40,7 +40,7 @@ TEST(getting, rows_come_in_the_order_of_the_keys)
 
 TEST(getting, many_keys_are_found_as_well_as_few)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     EXPECT_EQ(at.run({"get", "hosts", "beta", "x1", "x2", "x3", "x4", "x5", "ab", "-H", "-o", "csv", "-c", "name"}).out,
               "beta\r\nab\r\n");
@@ -48,7 +48,7 @@ TEST(getting, many_keys_are_found_as_well_as_few)
 
 TEST(getting, no_row_at_all_ends_with_1_and_says_which_keys)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const result rows = at.run({"get", "hosts", "gamma", "-o", "json"});
     EXPECT_EQ(rows.code, 1);
@@ -58,7 +58,7 @@ TEST(getting, no_row_at_all_ends_with_1_and_says_which_keys)
 
 TEST(getting, keys_of_each_type_are_understood_and_negative_ones_need_no_trick)
 {
-    workplace at;
+    scratch at;
     for (const std::string type : {"int32", "int64", "float32", "float64"}) {
         ASSERT_EQ(at.run({"import", type, "-", "--create", "--types", "id:" + type}, "id,n\n-5,1\n6,2\n").code, 0);
         EXPECT_EQ(at.run({"get", type, "-5", "-o", "jsonl", "-c", "n"}).out, "{\"n\":1}\n") << type;
@@ -72,7 +72,7 @@ TEST(getting, keys_of_each_type_are_understood_and_negative_ones_need_no_trick)
 
 TEST(getting, a_key_that_is_none_is_a_usage_error)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(at.run({"import", "numbers", "-", "--create"}, "id,n\n1,2\n").code, 0);
     const result rows = at.run({"get", "numbers", "1", "one"});
     EXPECT_EQ(rows.code, 2);
@@ -82,7 +82,7 @@ TEST(getting, a_key_that_is_none_is_a_usage_error)
 
 TEST(selecting, columns_are_chosen_and_ordered_by_the_user)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     EXPECT_EQ(at.run({"select", "hosts", "-c", "cpus,name", "-o", "csv"}).out,
               "cpus,name\r\n4,alpha\r\n16,beta\r\n8,ab\r\n");
@@ -93,7 +93,7 @@ TEST(selecting, columns_are_chosen_and_ordered_by_the_user)
 
 TEST(selecting, rows_are_sorted_by_value_and_limited_behind_that)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const auto names = [&](const std::vector<std::string> & options) {
         std::vector<std::string> arguments = {"select", "hosts", "-c", "name", "-H", "-o", "tsv"};
@@ -110,7 +110,7 @@ TEST(selecting, rows_are_sorted_by_value_and_limited_behind_that)
 
 TEST(selecting, sorting_is_exact_at_the_edges_of_64_bits_and_puts_nan_last)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(
         at.run({"import", "a", "-", "--create", "--types", "i:int64,r:float64"},
                "name,i,r\na,9223372036854775807,nan\nb,-9223372036854775808,inf\nc,9223372036854775806,-1\nd,-1,0.5\n")
@@ -122,7 +122,7 @@ TEST(selecting, sorting_is_exact_at_the_edges_of_64_bits_and_puts_nan_last)
 
 TEST(selecting, count_is_a_number_and_an_object_in_json)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     EXPECT_EQ(at.run({"select", "hosts", "--count"}).out, "3\n");
     EXPECT_EQ(at.run({"select", "hosts", "--count", "-o", "json"}).out, "[\n {\"count\":3}\n]\n");
@@ -130,7 +130,7 @@ TEST(selecting, count_is_a_number_and_an_object_in_json)
 
 TEST(selecting, talk_goes_to_standard_error_and_quiet_ends_it)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     EXPECT_EQ(at.run({"select", "hosts"}).err, "ktrg: 3 rows\n");
     EXPECT_EQ(at.run({"select", "hosts", "-q"}).err, "");
@@ -141,7 +141,7 @@ TEST(selecting, talk_goes_to_standard_error_and_quiet_ends_it)
 
 TEST(listing, shows_tables_and_passes_over_everything_else)
 {
-    workplace at;
+    scratch at;
     make_hosts(at, "hosts");
     make_hosts(at, "net,hosts");
     at.write("README.md", "not a table");
@@ -160,7 +160,7 @@ TEST(listing, shows_tables_and_passes_over_everything_else)
 
 TEST(listing, a_damaged_table_is_listed_and_told_and_the_rest_goes_on)
 {
-    workplace at;
+    scratch at;
     make_hosts(at, "bad");
     make_hosts(at, "good");
     at.write("bad", at.read("bad").substr(0, 150));
@@ -175,13 +175,13 @@ TEST(listing, a_damaged_table_is_listed_and_told_and_the_rest_goes_on)
 
 TEST(listing, a_directory_that_is_not_there_ends_with_3)
 {
-    workplace at;
+    scratch at;
     EXPECT_EQ(at.run({"ls", "nowhere"}).code, 3);
 }
 
 TEST(schema, in_json_tells_types_keys_flags_and_defaults)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(
         at.run({"import", "a", "-", "--create", "--types", "n:uint32:protected:reset=7,s:struct(x:int32,y:string[])"},
                "name,n,s\nx,1,{}\n")
@@ -200,7 +200,7 @@ TEST(schema, in_json_tells_types_keys_flags_and_defaults)
 
 TEST(stat, the_kinds_of_bytes_add_up_to_the_file)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const auto stat = nlohmann::json::parse(at.run({"stat", "hosts", "-o", "json"}).out)[0];
     EXPECT_EQ(stat["file_bytes"], at.read("hosts").size());
@@ -214,7 +214,7 @@ TEST(stat, the_kinds_of_bytes_add_up_to_the_file)
 
 TEST(stat, shows_what_a_killed_writer_left_as_dead_and_the_table_stands_at_its_last_commit)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const std::size_t before = at.read("hosts").size();
     EXPECT_EQ(at.run_program(KILLED_WRITER_PROGRAM, {".", "hosts", "name", "50"}).code, 128 + SIGKILL);
@@ -232,7 +232,7 @@ TEST(stat, shows_what_a_killed_writer_left_as_dead_and_the_table_stands_at_its_l
 
 TEST(names, without_a_slash_are_looked_for_in_ktrg_root)
 {
-    workplace at;
+    scratch at;
     at.write("state/x", "");
     make_hosts(at, "state/hosts");
     EXPECT_EQ(at.run({"select", "hosts", "--count"}).code, 3);
@@ -245,7 +245,7 @@ TEST(names, without_a_slash_are_looked_for_in_ktrg_root)
 
 TEST(names, a_comma_in_a_file_name_is_a_slash_of_its_registry_path)
 {
-    workplace at;
+    scratch at;
     make_hosts(at, "net,hosts");
     EXPECT_TRUE(at.exists("net,hosts"));
     EXPECT_EQ(at.run({"select", "net,hosts", "--count"}).out, "3\n");
@@ -253,7 +253,7 @@ TEST(names, a_comma_in_a_file_name_is_a_slash_of_its_registry_path)
 
 TEST(names, that_no_registry_path_has_are_refused_with_102)
 {
-    workplace at;
+    scratch at;
     for (const std::string name : {"hosts.csv", "a-b", "a b", ",Lock", "a,,b", "\xc3\xa4", "x.rewrite"}) {
         const result end = at.run({"select", name});
         EXPECT_EQ(end.code, 2) << name;
@@ -265,7 +265,7 @@ TEST(names, that_no_registry_path_has_are_refused_with_102)
 
 TEST(names, a_directory_is_told_from_a_table)
 {
-    workplace at;
+    scratch at;
     at.write("state/x", "");
     const result end = at.run({"select", "state"});
     EXPECT_EQ(end.code, 2);
@@ -274,7 +274,7 @@ TEST(names, a_directory_is_told_from_a_table)
 
 TEST(names, a_counter_behind_an_at_sign_is_demanded)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     EXPECT_EQ(at.run({"select", "hosts@2", "--count"}).out, "3\n");
     const result moved = at.run({"select", "hosts@1", "--count"});
@@ -287,7 +287,7 @@ TEST(names, a_counter_behind_an_at_sign_is_demanded)
 
 TEST(command_line, unknown_verbs_and_options_end_with_2_and_a_hint)
 {
-    workplace    at;
+    scratch      at;
     const result verb = at.run({"slect", "hosts"});
     EXPECT_EQ(verb.code, 2);
     EXPECT_EQ(verb.err, "ktrg: no verb \"slect\" (did you mean \"select\"?); `ktrg --help` lists them\n");
@@ -300,7 +300,7 @@ TEST(command_line, unknown_verbs_and_options_end_with_2_and_a_hint)
 
 TEST(command_line, help_and_version_go_to_standard_output)
 {
-    workplace at;
+    scratch at;
     EXPECT_EQ(at.run({"--version"}).out, "ktrg 1.0.0\n");
     const result help = at.run({"import", "--help"});
     EXPECT_EQ(help.code, 0);
@@ -310,7 +310,7 @@ TEST(command_line, help_and_version_go_to_standard_output)
 
 TEST(command_line, common_options_stand_anywhere)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const std::string json = at.run({"select", "hosts", "-o", "json"}).out;
     EXPECT_EQ(at.run({"-o", "json", "select", "hosts"}).out, json);
@@ -319,7 +319,7 @@ TEST(command_line, common_options_stand_anywhere)
 
 TEST(command_line, errors_come_as_json_on_request)
 {
-    workplace    at;
+    scratch      at;
     const result end = at.run({"select", "state/hosts", "--errors", "json"});
     EXPECT_EQ(end.code, 3);
     const auto error = nlohmann::json::parse(end.err);
@@ -350,7 +350,7 @@ TEST(exit_codes, stand_for_the_codes_of_the_registry)
 
 TEST(exit_codes, a_damaged_table_ends_with_4)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     at.write("hosts", at.read("hosts").substr(0, 200));
     for (const std::string verb : {"select", "schema", "stat"}) {
@@ -403,7 +403,7 @@ class holder
 
 TEST(a_held_table, is_busy_for_a_writer_at_once)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const holder other(at.file("hosts"));
     const auto   started = std::chrono::steady_clock::now();
@@ -415,7 +415,7 @@ TEST(a_held_table, is_busy_for_a_writer_at_once)
 
 TEST(a_held_table, can_be_read)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
     const holder other(at.file("hosts"));
     EXPECT_EQ(at.run({"select", "hosts", "--count"}).out, "3\n");
@@ -426,10 +426,10 @@ TEST(a_held_table, can_be_read)
 
 TEST(a_held_table, is_waited_for_on_request)
 {
-    workplace at;
+    scratch at;
     make_hosts(at);
-    holder                   other(at.file("hosts"));
-    const workplace::running import = at.start({"import", "hosts", "-", "--wait", "30"});
+    holder                 other(at.file("hosts"));
+    const scratch::running import = at.start({"import", "hosts", "-", "--wait", "30"});
     ASSERT_GT(write(import.input, "name\ngamma\n", 11), 0);
     close(dup(import.input));
     std::thread  later([&other] {

@@ -72,7 +72,7 @@ int code_of(int wait_status)
     return WIFEXITED(wait_status) ? WEXITSTATUS(wait_status) : 128 + WTERMSIG(wait_status);
 }
 
-workplace::workplace()
+scratch::scratch()
 {
     std::string pattern = std::filesystem::temp_directory_path() / "ktrg_test_XXXXXX";
     EXPECT_NE(mkdtemp(pattern.data()), nullptr);
@@ -80,29 +80,29 @@ workplace::workplace()
     std::filesystem::create_directory(path_ + "/.io");
 }
 
-workplace::~workplace()
+scratch::~scratch()
 {
     std::error_code ignored;
     std::filesystem::remove_all(path_, ignored);
 }
 
-void workplace::write(const std::string & name, const std::string & content) const
+void scratch::write(const std::string & name, const std::string & content) const
 {
     std::filesystem::create_directories(std::filesystem::path(file(name)).parent_path());
     std::ofstream(file(name), std::ios::binary) << content;
 }
 
-std::string workplace::read(const std::string & name) const
+std::string scratch::read(const std::string & name) const
 {
     return read_all(file(name));
 }
 
-bool workplace::exists(const std::string & name) const
+bool scratch::exists(const std::string & name) const
 {
     return std::filesystem::exists(file(name));
 }
 
-std::vector<std::string> workplace::full_environment() const
+std::vector<std::string> scratch::full_environment() const
 {
     std::vector<std::string> result = {"PATH=/usr/bin:/bin", "TERM=xterm"};
     for (const char * p_name : {"ASAN_OPTIONS", "UBSAN_OPTIONS", "LD_LIBRARY_PATH"})
@@ -112,13 +112,13 @@ std::vector<std::string> workplace::full_environment() const
     return result;
 }
 
-result workplace::run(const std::vector<std::string> & arguments, const std::string & input) const
+result scratch::run(const std::vector<std::string> & arguments, const std::string & input) const
 {
     return run_program(KTRG_PROGRAM, arguments, input);
 }
 
-result workplace::run_program(const std::string & program, const std::vector<std::string> & arguments,
-                              const std::string & input) const
+result scratch::run_program(const std::string & program, const std::vector<std::string> & arguments,
+                            const std::string & input) const
 {
     write(".io/in", input);
     const pid_t pid = fork();
@@ -132,7 +132,7 @@ result workplace::run_program(const std::string & program, const std::vector<std
     return {code_of(status), read(".io/out"), read(".io/err")};
 }
 
-result workplace::run_on_terminal(const std::vector<std::string> & arguments, unsigned short width) const
+result scratch::run_on_terminal(const std::vector<std::string> & arguments, unsigned short width) const
 {
     int           terminal = -1;
     const winsize size     = {25, width, 0, 0};
@@ -155,7 +155,7 @@ result workplace::run_on_terminal(const std::vector<std::string> & arguments, un
     return end;
 }
 
-workplace::running workplace::start(const std::vector<std::string> & arguments) const
+scratch::running scratch::start(const std::vector<std::string> & arguments) const
 {
     int ends[2] = {-1, -1};
     EXPECT_EQ(pipe2(ends, O_CLOEXEC), 0);
@@ -170,7 +170,7 @@ workplace::running workplace::start(const std::vector<std::string> & arguments) 
     return {pid, ends[1]};
 }
 
-result workplace::finish(running what) const
+result scratch::finish(running what) const
 {
     close(what.input);
     const int status = wait_for(what.pid);

@@ -20,13 +20,13 @@ struct result {
 };
 
 // A working directory, removed with all that is in it, and ktrg in it.
-class workplace
+class scratch
 {
   public:
-    workplace();
-    ~workplace();
-    workplace(const workplace &)             = delete;
-    workplace & operator=(const workplace &) = delete;
+    scratch();
+    ~scratch();
+    scratch(const scratch &)             = delete;
+    scratch & operator=(const scratch &) = delete;
 
     [[nodiscard]] std::string file(const std::string & name) const { return path_ + "/" + name; }
     void                      write(const std::string & name, const std::string & content) const;

@@ -7,7 +7,7 @@
 #include "program.h"
 #include "table_file.h"
 
-using ktrg_test::workplace;
+using ktrg_test::scratch;
 
 namespace
 {
@@ -47,12 +47,12 @@ std::vector<std::uint8_t> example_of(std::size_t length)
     return bytes;
 }
 
-void write_bytes(const workplace & at, const std::vector<std::uint8_t> & bytes)
+void write_bytes(const scratch & at, const std::vector<std::uint8_t> & bytes)
 {
     at.write("t", std::string(bytes.begin(), bytes.end()));
 }
 
-ktrg::table_file read(const workplace & at)
+ktrg::table_file read(const scratch & at)
 {
     return ktrg::read_table_file(at.file("t"), "t");
 }
@@ -64,7 +64,7 @@ void expect_sum(const ktrg::table_file & file)
 
 TEST(reading_a_table_file, the_worked_example_step_by_step)
 {
-    workplace at;
+    scratch at;
     ASSERT_EQ(example().size(), 271U);
 
     write_bytes(at, example_of(115));
@@ -102,7 +102,7 @@ TEST(reading_a_table_file, the_worked_example_step_by_step)
 
 TEST(reading_a_table_file, bytes_behind_the_live_commit_record_are_dead)
 {
-    workplace                 at;
+    scratch                   at;
     std::vector<std::uint8_t> bytes = example_of(115);
     bytes.resize(500, 0xAB);
     write_bytes(at, bytes);
@@ -114,7 +114,7 @@ TEST(reading_a_table_file, bytes_behind_the_live_commit_record_are_dead)
 
 TEST(reading_a_table_file, every_shorter_length_is_refused_as_damaged)
 {
-    workplace at;
+    scratch at;
     for (std::size_t length = 0; length < example().size(); length++) {
         write_bytes(at, {example().begin(), example().begin() + static_cast<std::ptrdiff_t>(length)});
         try {
@@ -128,7 +128,7 @@ TEST(reading_a_table_file, every_shorter_length_is_refused_as_damaged)
 
 TEST(reading_a_table_file, any_changed_byte_is_read_or_refused_and_the_sum_is_right)
 {
-    workplace   at;
+    scratch     at;
     std::size_t refused = 0;
     for (std::size_t i = 0; i < example().size(); i++) {
         for (const int change : {0x00, 0xFF, 0x100}) {
@@ -148,7 +148,7 @@ TEST(reading_a_table_file, any_changed_byte_is_read_or_refused_and_the_sum_is_ri
 
 TEST(reading_a_table_file, what_replaces_or_deletes_a_row_that_is_not_there_has_its_code)
 {
-    workplace                 at;
+    scratch                   at;
     std::vector<std::uint8_t> bytes = example();
     bytes[183]                      = 0x74;
     write_bytes(at, bytes);
@@ -171,7 +171,7 @@ TEST(reading_a_table_file, what_replaces_or_deletes_a_row_that_is_not_there_has_
 
 TEST(reading_a_table_file, a_file_that_is_not_there_or_not_a_file_is_told)
 {
-    workplace at;
+    scratch at;
     try {
         (void)ktrg::read_table_file(at.file("nowhere"), "nowhere");
         ADD_FAILURE();

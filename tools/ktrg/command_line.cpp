@@ -58,6 +58,9 @@ struct settings {
     get_options    get;
     select_options select;
     import_options import;
+    create_options create;
+    put_options    put;
+    rm_options     rm;
 
     std::function<exit_code()> verb;
 };
@@ -85,6 +88,7 @@ void add_common_options(CLI::App & app, settings & set)
         ->check(CLI::NonNegativeNumber.description(""))
         ->type_name("SECONDS");
     app.add_flag("-n,--dry-run", set.common.dry_run, "Do all but the change itself");
+    app.add_flag("-f,--force", set.common.force, "Do what destroys");
     app.add_flag("-q,--quiet", set.common.quiet, "No counts and hints on standard error");
     app.add_flag("-v,--verbose", set.common.verbose, "More of them");
 }
@@ -149,6 +153,27 @@ void add_writing_verbs(CLI::App & app, settings & set)
         ->type_name("FROM=TO,...")
         ->allow_extra_args(false);
     p_import->callback([&set] { set.verb = [&set] { return run_import(set.common, set.import); }; });
+
+    CLI::App * p_put = app.add_subcommand("put", "Add a row, or update the one with the key")->group("Write");
+    p_put->add_option("TABLE", set.put.table, "Path of the table")->required();
+    p_put->add_option("COL=VAL", set.put.values, "Values; the key's is among them")->required();
+    CLI::Option * p_insert = p_put->add_flag("--insert", set.put.insert, "The row must be new");
+    p_put->add_flag("--update", set.put.update, "The row must exist")->excludes(p_insert);
+    p_put->callback([&set] { set.verb = [&set] { return run_put(set.common, set.put); }; });
+
+    CLI::App * p_rm = app.add_subcommand("rm", "Delete rows, in one transaction")->group("Write");
+    p_rm->add_option("TABLE", set.rm.table, "Path of the table")->required();
+    p_rm->add_option("KEY", set.rm.keys, "Keys of the rows");
+    p_rm->add_flag("--all", set.rm.all, "Every row; needs --force");
+    p_rm->callback([&set] { set.verb = [&set] { return run_rm(set.common, set.rm); }; });
+
+    CLI::App * p_create = app.add_subcommand("create", "Make an empty table")->group("Shape");
+    p_create->add_option("TABLE", set.create.table, "Path of the table")->required();
+    p_create
+        ->add_option("COLUMN", set.create.columns,
+                     "Columns as name:type[:flags][=default], as in id:uint32:key name:string= load:float64")
+        ->required();
+    p_create->callback([&set] { set.verb = [&set] { return run_create(set.common, set.create); }; });
 }
 
 bool wants_colour(const std::string & when, bool terminal)
@@ -179,6 +204,8 @@ void finish_settings(settings & set)
                                                          : bytes_form::hex;
     style.values.int64_as_string = set.int64 == "string";
     for (std::string & key : set.get.keys)
+        unmark(key);
+    for (std::string & key : set.rm.keys)
         unmark(key);
 }
 

@@ -338,6 +338,38 @@ kt_int32_t table::add(const std::vector<kt_char_ptr_t> & names, const std::vecto
                         static_cast<kt_uint32_t>(names.size()));
 }
 
+kt_int32_t table::set(kt_value_t key, const std::vector<kt_char_ptr_t> & names,
+                      const std::vector<kt_value_t *> & values) const
+{
+    // An update of no columns still resets those that are flagged so; the arrays may not be NULL.
+    kt_char_ptr_t no_name    = nullptr;
+    kt_value_t *  p_no_value = nullptr;
+    return rg_set_fields_by_key_1(handle_, key, names.empty() ? &no_name : const_cast<kt_char_ptr_t *>(names.data()),
+                                  values.empty() ? &p_no_value : const_cast<kt_value_t **>(values.data()),
+                                  static_cast<kt_uint32_t>(names.size()));
+}
+
+bool table::contains(kt_value_t key) const
+{
+    kt_uint32_t      row  = 0;
+    const kt_int32_t code = rg_get_fixed_row_index_for_key_1(handle_, key, &row);
+    if (code != RG_E_NO_SUCH_KEY)
+        check(code, where_);
+    return code == 0;
+}
+
+void table::delete_at(std::uint64_t position) const
+{
+    check(rg_delete_row_by_index_1(handle_, static_cast<kt_uint32_t>(position)), where_);
+}
+
+void table::finish(bool dry_run)
+{
+    if (!dry_run)
+        commit();
+    close();
+}
+
 void table::commit()
 {
     check(rg_apply_1(handle_, 0), where_);

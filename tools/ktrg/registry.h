@@ -71,8 +71,17 @@ class table
     [[nodiscard]] kt_int32_t add(const std::vector<kt_char_ptr_t> & names,
                                  const std::vector<kt_value_t *> &  values) const;
 
+    // Sets columns of the row with the key.
+    [[nodiscard]] kt_int32_t set(kt_value_t key, const std::vector<kt_char_ptr_t> & names,
+                                 const std::vector<kt_value_t *> & values) const;
+    [[nodiscard]] bool       contains(kt_value_t key) const;
+    // Deletes the row at a position. Positions stay what they are until the commit.
+    void delete_at(std::uint64_t position) const;
+
     // Makes all that is pending permanent, in one transaction.
     void commit();
+    // Commits and closes; a dry run drops what is pending instead.
+    void finish(bool dry_run);
     // Gives the table back. What isn't committed is gone.
     void close();
     // Closes a table that create() made, and removes its file.

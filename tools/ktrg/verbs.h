@@ -21,6 +21,7 @@ struct common_options {
     bool                       quiet        = false;
     bool                       verbose      = false;
     bool                       dry_run      = false;
+    bool                       force        = false;
     double                     wait_seconds = 0;
 
     // The style with the form that the user asked for, or else the verb's own.
@@ -64,11 +65,32 @@ struct import_options {
     std::vector<std::string> renamed; // a=b: the file's column a is the table's b
 };
 
+struct create_options {
+    std::string              table;
+    std::vector<std::string> columns; // name:type[:flags][=default]
+};
+
+struct put_options {
+    std::string              table;
+    std::vector<std::string> values; // COL=VAL
+    bool                     insert = false;
+    bool                     update = false;
+};
+
+struct rm_options {
+    std::string              table;
+    std::vector<std::string> keys;
+    bool                     all = false;
+};
+
 [[nodiscard]] exit_code run_ls(const common_options & common, const ls_options & options);
 [[nodiscard]] exit_code run_schema(const common_options & common, const table_options & options);
 [[nodiscard]] exit_code run_stat(const common_options & common, const table_options & options);
 [[nodiscard]] exit_code run_get(const common_options & common, const get_options & options);
 [[nodiscard]] exit_code run_select(const common_options & common, const select_options & options);
 [[nodiscard]] exit_code run_import(const common_options & common, const import_options & options);
+[[nodiscard]] exit_code run_create(const common_options & common, const create_options & options);
+[[nodiscard]] exit_code run_put(const common_options & common, const put_options & options);
+[[nodiscard]] exit_code run_rm(const common_options & common, const rm_options & options);
 
 } // namespace ktrg
