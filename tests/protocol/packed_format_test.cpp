@@ -89,3 +89,45 @@ TEST(the_worked_example_of_a_buffer, finds_its_row_as_the_document_says)
     EXPECT_EQ(row_start(buffer, 0, 0), 420u);
     EXPECT_EQ(word_at(buffer, 420), 43u);
 }
+
+// ---- Buffers that machines have packed ----
+//
+// Made by tests/foreign/run.sh --golden: the same table, packed on a machine of each byte order.
+
+namespace
+{
+
+octets golden_buffer(const std::string & name)
+{
+    const std::string all = file_beside(here / "golden" / name);
+    EXPECT_EQ(all.size(), 4957u) << name;
+    return {all.begin(), all.end()};
+}
+
+void expect_unpacks(octets buffer)
+{
+    ASSERT_EQ(rg_convert_packed_table_buffer_1(buffer.data(), 0, 0), 0) << error_text();
+    open_tree tree;
+    expect_rows(unpacked(buffer, tree), table_of_everything());
+}
+
+} // namespace
+
+TEST(a_golden_buffer, of_a_little_endian_machine_unpacks)
+{
+    expect_unpacks(golden_buffer("little_endian.packed"));
+}
+
+TEST(a_golden_buffer, of_a_big_endian_machine_unpacks)
+{
+    expect_unpacks(golden_buffer("big_endian.packed"));
+}
+
+TEST(a_golden_buffer, of_this_byte_order_is_what_packing_gives_today)
+{
+    octets buffer =
+        golden_buffer(std::endian::native == std::endian::big ? "big_endian.packed" : "little_endian.packed");
+    clear_row_words(buffer);
+    EXPECT_EQ(to_hex(buffer),
+              to_hex(buffer_of({packed_form(table_of_everything(), machine::here, {}, 3)}, machine::here)));
+}
