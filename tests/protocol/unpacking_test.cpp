@@ -271,6 +271,52 @@ TEST(unpacking, links_and_file_offsets_of_the_sender_mean_nothing)
     expect_rows(unpacked(buffer, tree), small_table());
 }
 
+// ---- With other calls ----
+
+TEST(unpacking_and_then, rows_are_selected_and_the_result_is_packed_without_a_name)
+{
+    octets                   buffer = local_buffer(small_table());
+    open_tree                tree;
+    const rg_opaque_handle_t handle = unpacked(buffer, tree);
+    rg_opaque_handle_t       result = nullptr;
+    ASSERT_EQ(rg_select_1(handle, nullptr, 0, &result, text("id == 22")), 0) << error_text();
+    octets again = packed({{result}});
+    EXPECT_EQ(row_count(again), 1u);
+    EXPECT_EQ(item_model(again, 0, item::name).text, "");
+    EXPECT_EQ(item_model(again, 0, item::fixed_metadata).elements[0].text, "");
+    EXPECT_EQ(rg_close_table_1(result), 0);
+}
+
+// A copy in memory maps the rows' addresses through the blocks of the pool, and these rows lie in none.
+TEST(unpacking_and_then, a_copy_in_memory_keeps_the_count_and_no_rows)
+{
+    octets                   buffer = local_buffer(small_table());
+    open_tree                tree;
+    const rg_opaque_handle_t handle = unpacked(buffer, tree);
+    ASSERT_EQ(rg_copy_table_by_handle_1(handle, text("copy"), 0), 0) << error_text();
+    const rg_opaque_handle_t copy = open_table(tree, "copy", RG_MODE_READ);
+    ASSERT_NE(copy, nullptr);
+    EXPECT_EQ(object_of(copy).total_committed_rows, 2u);
+    EXPECT_NE(read_packed(copy, 0, "id").rc, 0);
+    EXPECT_EQ(row_count(packed({{copy}})), 0u) << "there is nothing to pack";
+    expect_rows(handle, small_table());
+}
+
+TEST(unpacking_and_then, a_copy_to_a_file_has_all_rows_whatever_offsets_the_sender_had)
+{
+    const row_words          words  = {0, 2, 0x01020304, 0x0A0B0C0D, 0xCAFE0001};
+    octets                   buffer = local_buffer({packed_form(small_table(), machine::here, words)});
+    registry_of_tables       registry;
+    const rg_opaque_handle_t handle = unpacked(buffer, registry.tree);
+    ASSERT_EQ(rg_copy_table_by_handle_1(handle, text("/kept/copy"), 0), 0) << error_text();
+    kt_int32_t               rc   = 0;
+    const rg_opaque_handle_t copy = open_table(registry.tree, "/kept/copy", RG_MODE_WRITE, &rc);
+    ASSERT_EQ(rc, 0) << error_text();
+    expect_rows(copy, small_table());
+    EXPECT_EQ(add_row(copy, {{"id", uint32(33)}}), 0) << error_text();
+    EXPECT_EQ(rg_close_table_1(copy), 0);
+}
+
 // ---- Keys ----
 
 TEST(unpacking_keys, with_buckets_the_key_is_hashed)
