@@ -28,7 +28,7 @@ enum class row_role { applied, committed };
 template <class Visit> [[nodiscard]] kt_int32_t rg_i_walk_rows(rg_i_table_t * p_table, row_role role, Visit && visit)
 {
     // Slots follow each other in memory and records don't: a few are asked for ahead, so that their coming overlaps.
-    constexpr kt_uint32_t ahead = 12;
+    constexpr kt_uint32_t ahead = 24;
 
     const kt_uint32_t total_rows   = rg_i_rows_in_role(p_table, role);
     const kt_uint32_t maximum_rows = p_table->maximum_rows;

@@ -15,6 +15,7 @@
 #include <cstring>
 
 #include "frame/rg_i_trace.h"
+#include "memory/rg_i_large_pages.h"
 #include "rg_i_free_slot_index.h"
 #include "storage/rg_i_disk_format.h"
 
@@ -175,8 +176,8 @@ kt_uint32_t rg_i_default_data_length(const rg_i_table_t * p_table)
     if (p_table->total_columns == 0)
         return 0;
     // The first name stands directly behind the default data of the record that it lies in.
-    const kt_char_t * const p_behind_columns = rg_i_names_record_data(p_table) + sizeof(rg_i_metadata_head_t) +
-                                               p_table->total_columns * sizeof(rg_column_t);
+    const kt_char_t * const p_behind_columns =
+        rg_i_names_record_data(p_table) + sizeof(rg_i_metadata_head_t) + p_table->total_columns * sizeof(rg_column_t);
     return static_cast<kt_uint32_t>(p_table->p_columns[0].name - p_behind_columns);
 }
 
@@ -217,9 +218,10 @@ kt_int32_t rg_i_establish_rows_index(rg_i_table_t * p_table, kt_uint32_t maximum
         maximum_rows = rows_if_unspecified;
 
     p_table->p_rows_fixed_index =
-        static_cast<rg_i_index_entry_t *>(std::malloc(rg_i_rows_fixed_index_bytes(maximum_rows)));
+        static_cast<rg_i_index_entry_t *>(std::calloc(1, rg_i_rows_fixed_index_bytes(maximum_rows)));
     if (p_table->p_rows_fixed_index == nullptr)
         return rg_i_fail_no_memory(RG_HERE);
+    rg_i_prefer_large_pages(p_table->p_rows_fixed_index, rg_i_rows_fixed_index_bytes(maximum_rows));
     p_table->p_rows_packed_index = static_cast<kt_uint32_t *>(std::calloc(maximum_rows, sizeof(kt_uint32_t)));
     if (p_table->p_rows_packed_index == nullptr)
         return rg_i_fail_no_memory(RG_HERE); // rg_i_close_table frees the other array
@@ -262,10 +264,13 @@ kt_int32_t rg_i_grow_index(rg_i_table_t * p_table, kt_uint32_t total_new_rows)
     void *     p_fixed_index = std::realloc(p_table->p_rows_fixed_index, rg_i_rows_fixed_index_bytes(maximum_rows));
     if (p_fixed_index == nullptr)
         return rg_i_fail_no_memory(RG_HERE); // a packed index that is longer than needed does no harm
+    rg_i_prefer_large_pages(p_fixed_index, rg_i_rows_fixed_index_bytes(maximum_rows));
 
     // Nothing below fails.
     p_table->p_rows_fixed_index = static_cast<rg_i_index_entry_t *>(p_fixed_index);
     p_table->maximum_rows       = maximum_rows;
+    std::memset(static_cast<void *>(p_table->p_rows_fixed_index + first_new_slot), 0,
+                total_new_rows * sizeof(rg_i_index_entry_t));
     free_slots_from(p_table, first_new_slot);
     if (reinterpret_cast<std::uintptr_t>(p_fixed_index) != old_slots) {
         follow_moved_slots(p_table->p_rows_change_list, old_slots, p_table->p_rows_fixed_index);
