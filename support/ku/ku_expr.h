@@ -160,8 +160,9 @@ enum ku_operation_t : uint8_t {
     KU_OP_MULTIPLY_FLOATINGS,
     KU_OP_DIVIDE_FLOATINGS,
 
-    KU_OP_LIST_ELEMENT, // pops an element; if it equals the value below: that becomes the answer, jump to `target`
-    KU_OP_LIST_END,     // the value at the top becomes the answer "not found"
+    KU_OP_LIST_ELEMENT,  // pops an element; if it equals the value below: that becomes the answer, jump to `target`
+    KU_OP_LIST_CONSTANT, // the same with a constant as the element
+    KU_OP_LIST_END,      // the value at the top becomes the answer "not found"
 
     // Tests of a column against constants; they need nothing on the stack. `operand`: the column.
     KU_OP_FIRST_TEST,

@@ -53,7 +53,7 @@ void ku_expr_code::truncate(kt_uint32_t start, kt_uint32_t values)
     for (kt_uint32_t i = start; i < position(); i++) {
         const uint8_t operation = code_[i].operation;
         if (operation == KU_OP_INTEGER || operation == KU_OP_FLOATING || operation == KU_OP_TEXT ||
-            (operation >= KU_OP_FIRST_TEST && operation <= KU_OP_STRING_CONTAINS)) {
+            operation == KU_OP_LIST_CONSTANT || (operation >= KU_OP_FIRST_TEST && operation <= KU_OP_STRING_CONTAINS)) {
             constants_.truncate(code_[i].constant); // constants stand in the order of their instructions
             break;
         }
@@ -566,10 +566,17 @@ void ku_expr_code::end_chain(kt_uint32_t chain)
     seal();
 }
 
-void ku_expr_code::list_element(ku_expr_kind_t value_kind, ku_expr_kind_t element_kind, bool negated,
+void ku_expr_code::list_element(ku_expr_kind_t value_kind, const ku_operand_t & element, bool negated,
                                 kt_uint32_t * p_chain)
 {
-    emit(KU_OP_LIST_ELEMENT, pair_of(value_kind, element_kind), 0, -1);
+    const uint8_t pair = pair_of(value_kind, element.kind);
+    if (is_constant(element.start, position())) {
+        code_[element.start].operation = KU_OP_LIST_CONSTANT;
+        code_[element.start].detail    = pair;
+        depth_--;
+    } else {
+        emit(KU_OP_LIST_ELEMENT, pair, 0, -1);
+    }
     if (failed_)
         return;
     code_[position() - 1].negated = negated ? 1 : 0;

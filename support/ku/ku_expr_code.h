@@ -54,7 +54,7 @@ class ku_expr_code
     void invert(const ku_operand_t & operand);
 
     // ---- Lists: the value, and then for each element its instructions and list_element() ----
-    void list_element(ku_expr_kind_t value_kind, ku_expr_kind_t element_kind, bool negated, kt_uint32_t * p_chain);
+    void list_element(ku_expr_kind_t value_kind, const ku_operand_t & element, bool negated, kt_uint32_t * p_chain);
     void list_end(bool negated, kt_uint32_t chain);
 
     // ---- Chains of && or || ----

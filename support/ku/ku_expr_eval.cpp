@@ -100,6 +100,26 @@ bool are_equal(uint8_t pair, const ku_value_t & left, const ku_value_t & right)
     }
 }
 
+// The right one of a pair, if it is a constant.
+ku_value_t value_of_constant(uint8_t pair, const ku_constant_t & constant, const uint8_t * p_texts)
+{
+    ku_value_t value;
+    switch (pair) {
+    case KU_PAIR_INTEGERS:
+    case KU_PAIR_FLOATING_WITH_INTEGER:
+        value.integer = constant.integer;
+        break;
+    case KU_PAIR_FLOATINGS:
+    case KU_PAIR_INTEGER_WITH_FLOATING:
+        value.floating = constant.floating;
+        break;
+    default:
+        value.bytes = {p_texts + constant.text.offset, constant.text.length, KU_LETTERS_AS_THEY_ARE};
+        break;
+    }
+    return value;
+}
+
 // Looks for the value among the elements. The first one that is damaged ends the search.
 [[nodiscard]] kt_int32_t find_in_array(const ku_instruction_t & instruction, const ku_value_t & value,
                                        const ku_value_t & array, bool * p_found)
@@ -287,6 +307,13 @@ template <kt_uint32_t Room>
         case KU_OP_LIST_ELEMENT:
             top--;
             if (are_equal(p->detail, stack[top], stack[top + 1])) {
+                stack[top].integer = 1 ^ p->negated;
+                p                  = p_instructions + p->target - 1;
+            }
+            continue;
+        case KU_OP_LIST_CONSTANT:
+            if (are_equal(p->detail, stack[top],
+                          value_of_constant(p->detail, p_constants[p->constant], program.texts()))) {
                 stack[top].integer = 1 ^ p->negated;
                 p                  = p_instructions + p->target - 1;
             }

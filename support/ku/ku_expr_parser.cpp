@@ -466,7 +466,7 @@ kt_int32_t parser::read_list(const char * p_at, bool negated, ku_operand_t * p_r
             return rc;
         if (const kt_int32_t rc = make_comparable(p_at, "in", p_result, &element); rc != 0)
             return rc;
-        code_.list_element(p_result->kind, element.kind, negated, &chain);
+        code_.list_element(p_result->kind, element, negated, &chain);
     } while (token_.kind == KU_TOKEN_COMMA);
     if (const kt_int32_t rc = expect(KU_TOKEN_CLOSE, "`,` or `)`"); rc != 0)
         return rc;
