@@ -100,24 +100,19 @@ bool are_equal(uint8_t pair, const ku_value_t & left, const ku_value_t & right)
     }
 }
 
-// The right one of a pair, if it is a constant.
-ku_value_t value_of_constant(uint8_t pair, const ku_constant_t & constant, const uint8_t * p_texts)
+// Numbers in lists are as common as long lists of them, so integers come first.
+bool equals_constant(uint8_t pair, const ku_value_t & left, const ku_constant_t & constant, const uint8_t * p_texts)
 {
-    ku_value_t value;
-    switch (pair) {
-    case KU_PAIR_INTEGERS:
-    case KU_PAIR_FLOATING_WITH_INTEGER:
-        value.integer = constant.integer;
-        break;
-    case KU_PAIR_FLOATINGS:
-    case KU_PAIR_INTEGER_WITH_FLOATING:
-        value.floating = constant.floating;
-        break;
-    default:
-        value.bytes = {p_texts + constant.text.offset, constant.text.length, KU_LETTERS_AS_THEY_ARE};
-        break;
-    }
-    return value;
+    if (pair == KU_PAIR_INTEGERS) [[likely]]
+        return left.integer == constant.integer;
+    ku_value_t right;
+    if (pair == KU_PAIR_FLOATING_WITH_INTEGER)
+        right.integer = constant.integer;
+    else if (pair == KU_PAIR_FLOATINGS || pair == KU_PAIR_INTEGER_WITH_FLOATING)
+        right.floating = constant.floating;
+    else
+        right.bytes = {p_texts + constant.text.offset, constant.text.length, KU_LETTERS_AS_THEY_ARE};
+    return are_equal(pair, left, right);
 }
 
 // Looks for the value among the elements. The first one that is damaged ends the search.
@@ -312,8 +307,7 @@ template <kt_uint32_t Room>
             }
             continue;
         case KU_OP_LIST_CONSTANT:
-            if (are_equal(p->detail, stack[top],
-                          value_of_constant(p->detail, p_constants[p->constant], program.texts()))) {
+            if (equals_constant(p->detail, stack[top], p_constants[p->constant], program.texts())) {
                 stack[top].integer = 1 ^ p->negated;
                 p                  = p_instructions + p->target - 1;
             }
