@@ -139,7 +139,7 @@ TEST(a_copy_to_a_file, takes_pending_updates_along_with_the_committed_counter)
 TEST(a_copy_to_a_file, does_not_stamp_the_rows_of_its_source)
 {
     places             p;
-    rg_opaque_handle_t table  = p.create("/r/t", {{1, 10}, {2, 20}, {3, 30}});
+    rg_opaque_handle_t table  = p.create("/r/t", {{1, 10}, {2, 20}, {3, 30}}, RG_MODE_WRITE, true);
     const auto         stamps = [&] {
         std::vector<kt_uint32_t> result;
         for (kt_uint32_t slot = 0; slot < 3; ++slot) {
