@@ -144,9 +144,9 @@ TEST(a_copy_to_a_file, does_not_stamp_the_rows_of_its_source)
         std::vector<kt_uint32_t> result;
         for (kt_uint32_t slot = 0; slot < 3; ++slot) {
             const rg_i_index_entry_t & entry = object(table).p_rows_fixed_index[slot];
-            result.push_back(entry.file_offset);
-            result.push_back(entry.applied_file_offset);
-            result.push_back(rg_i_record_head(entry.p_committed)->disk_table_offset);
+            result.push_back(+entry.file_offset); // packed fields are copied, not referred to
+            result.push_back(+entry.applied_file_offset);
+            result.push_back(+rg_i_record_head(entry.p_committed)->disk_table_offset);
         }
         return result;
     };
