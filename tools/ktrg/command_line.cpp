@@ -116,8 +116,10 @@ void add_reading_verbs(CLI::App & app, settings & set)
         ->allow_extra_args(false);
     p_get->callback([&set] { set.verb = [&set] { return run_get(set.common, set.get); }; });
 
-    CLI::App * p_select = app.add_subcommand("select", "Show the rows of a table")->group("Read");
+    CLI::App * p_select = app.add_subcommand("select", "Show the rows that match an expression, or all")->group("Read");
     p_select->add_option("TABLE", set.select.table, "Path of the table")->required();
+    p_select->add_option("EXPR", set.select.expression,
+                         "Which rows, as in 'load > 2 && name like \"a%\"'; all without it");
     p_select->add_option("-c,--columns", set.select.columns, "Columns to show, separated by commas")
         ->delimiter(',')
         ->type_name("COL,...")
@@ -164,6 +166,7 @@ void add_writing_verbs(CLI::App & app, settings & set)
     CLI::App * p_rm = app.add_subcommand("rm", "Delete rows, in one transaction")->group("Write");
     p_rm->add_option("TABLE", set.rm.table, "Path of the table")->required();
     p_rm->add_option("KEY", set.rm.keys, "Keys of the rows");
+    p_rm->add_option("-w,--where", set.rm.where, "The rows that match an expression")->type_name("EXPR");
     p_rm->add_flag("--all", set.rm.all, "Every row; needs --force");
     p_rm->callback([&set] { set.verb = [&set] { return run_rm(set.common, set.rm); }; });
 
@@ -205,6 +208,10 @@ void finish_settings(settings & set)
     style.values.int64_as_string = set.int64 == "string";
     for (std::string & key : set.get.keys)
         unmark(key);
+    if (set.select.expression.has_value())
+        unmark(*set.select.expression);
+    if (set.rm.where.has_value())
+        unmark(*set.rm.where);
     for (std::string & key : set.rm.keys)
         unmark(key);
 }

@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <chrono>
+#include <cstdarg>
 #include <cstdlib>
 #include <cstring>
 #include <thread>
@@ -19,6 +20,7 @@
 #include "failure.h"
 #include "interrupt.h"
 #include "key_hash.h"
+#include "selection.h"
 #include "table_file.h"
 #include "values.h"
 
@@ -83,6 +85,31 @@ void wait_while_held(const place & where, double wait_seconds)
                                            : "another process holds the table; --wait SECONDS waits for it");
         std::this_thread::sleep_for(std::chrono::milliseconds(20));
     }
+}
+
+// The library takes the values of the criteria's variables as a list only. Ours have none.
+kt_int32_t selected_rows(rg_opaque_handle_t handle, kt_char_ptr_t p_criteria, kt_uint32_t * p_count,
+                         kt_uint32_t ** p_p_rows, ...)
+{
+    va_list none;
+    va_start(none, p_p_rows);
+    const kt_int32_t code = rg_get_selected_rows_v_1(handle, p_criteria, none, 0, p_count, p_p_rows);
+    va_end(none);
+    return code;
+}
+
+column column_of(const rg_column_t & definition)
+{
+    column result;
+    result.name       = definition.name;
+    result.type       = definition.type;
+    result.qualifier  = definition.qualifier;
+    result.properties = definition.properties;
+    if (definition.sd_defn != nullptr)
+        for (kt_uint32_t i = 0; i < definition.sd_defn->number_of_fields; i++)
+            result.fields.push_back({definition.sd_defn->fields[i].name, definition.sd_defn->fields[i].type});
+    result.default_text = default_text_of(result, definition.default_value);
+    return result;
 }
 
 struct file_identity {
@@ -179,6 +206,24 @@ void table::mount()
     check(rg_mount_local_tree_1(tree_, const_cast<kt_char_ptr_t>(mount_point), writable(where_.directory), 0), where_);
 }
 
+// What the open table says of itself is exact, also where a writer came between our look at the file and the open.
+void table::take_metadata()
+{
+    constexpr kt_int32_t  all_columns = -1;
+    rg_table_metadata_t * p_metadata  = nullptr;
+    check(rg_get_table_metadata_1(handle_, all_columns, &p_metadata), where_);
+    counter_ = p_metadata->table_change_counter;
+    rows_    = p_metadata->number_of_rows;
+    columns_.clear();
+    for (kt_uint32_t i = 0; i < p_metadata->number_of_columns; i++)
+        columns_.push_back(column_of(p_metadata->column_definitions[i]));
+    rg_free_table_metadata_1(p_metadata);
+    if (where_.counter.has_value() && counter_ != *where_.counter)
+        throw failure(
+            exit_code::conflict, where_.name,
+            fmt::format("the change counter is {}, not {}: the table has changed", counter_, *where_.counter));
+}
+
 table table::open_for_reading(const place & where, bool hashed)
 {
     table       result(where);
@@ -197,6 +242,7 @@ table table::open_for_reading(const place & where, bool hashed)
     if (code == RG_E_DUPLICATE_KEY)
         code = rg_open_table_1(result.tree_, writable(where.registry_path), RG_MODE_READ, &result.handle_);
     check(code, where);
+    result.take_metadata();
     return result;
 }
 
@@ -217,8 +263,10 @@ table table::open_for_writing(const place & where, double wait_seconds)
                   where);
         else
             check(rg_open_table_1(result.tree_, writable(where.registry_path), mode, &result.handle_), where);
-        if (identity_of(where.file) == before)
+        if (identity_of(where.file) == before) {
+            result.take_metadata();
             return result;
+        }
         // Another writer rewrote the table while we opened it: what we hold is its former file.
     }
     throw failure(exit_code::busy, where.name, "other processes keep rewriting the table");
@@ -265,8 +313,8 @@ table table::create_in_memory(const place & where, const std::vector<column> & c
 }
 
 table::table(table && other) noexcept
-    : where_(std::move(other.where_)), columns_(std::move(other.columns_)), tree_(std::exchange(other.tree_, nullptr)),
-      handle_(std::exchange(other.handle_, nullptr))
+    : where_(std::move(other.where_)), columns_(std::move(other.columns_)), counter_(other.counter_),
+      rows_(other.rows_), tree_(std::exchange(other.tree_, nullptr)), handle_(std::exchange(other.handle_, nullptr))
 {
 }
 
@@ -285,7 +333,9 @@ void table::close()
 
 void table::remove()
 {
-    unlink(where_.file.c_str());
+    // While we hold its lock, so that no other writer gets hold of it in between.
+    if (tree_ != nullptr)
+        rg_delete_table_1(tree_, writable(where_.registry_path));
     close();
 }
 
@@ -320,14 +370,26 @@ bool table::read_by_key(kt_value_t key, row_values & values) const
     return true;
 }
 
-std::uint64_t table::count() const
+void table::read_fixed(kt_uint32_t row, row_values & values) const
 {
-    kt_char_ptr_t no_name    = nullptr;
-    kt_value_t *  p_no_value = nullptr;
-    std::uint64_t rows       = 0;
-    while (rows <= INT32_MAX &&
-           rg_get_fields_by_index_1(handle_, static_cast<kt_int32_t>(rows), &no_name, &p_no_value, 0) == 0)
-        rows++;
+    values.release();
+    const kt_int32_t code = rg_get_fields_by_fixed_index_and_visibility_1(
+        handle_, static_cast<kt_int32_t>(row), values.names_.data(), values.addresses_.data(),
+        static_cast<kt_uint32_t>(values.names_.size()), 0, nullptr);
+    if (code == RG_E_LIBRARY_CALL)
+        throw failure(exit_code::damaged, where_.name, fmt::format("row {} holds a damaged value", row), code);
+    check(code, where_);
+}
+
+std::vector<kt_uint32_t> table::matching(const std::string & expression) const
+{
+    check_expression(expression, columns_, where_.name);
+    std::string   criteria = criteria_for(expression);
+    kt_uint32_t   count    = 0;
+    kt_uint32_t * p_rows   = nullptr;
+    check(selected_rows(handle_, criteria.data(), &count, &p_rows), where_);
+    std::vector<kt_uint32_t> rows(p_rows, p_rows + count);
+    std::free(p_rows);
     return rows;
 }
 
@@ -361,6 +423,19 @@ bool table::contains(kt_value_t key) const
 void table::delete_at(std::uint64_t position) const
 {
     check(rg_delete_row_by_index_1(handle_, static_cast<kt_uint32_t>(position)), where_);
+}
+
+std::size_t table::delete_matching(const std::string & expression) const
+{
+    const std::size_t matches = matching(expression).size();
+    if (matches != 0)
+        check(rg_delete_rows_1(handle_, criteria_for(expression).data()), where_);
+    return matches;
+}
+
+void table::delete_all() const
+{
+    check(rg_delete_rows_1(handle_, nullptr), where_);
 }
 
 void table::finish(bool dry_run)

@@ -60,12 +60,18 @@ class table
     [[nodiscard]] const std::vector<column> & columns() const { return columns_; }
     [[nodiscard]] rg_opaque_handle_t          handle() const { return handle_; }
 
+    // As of the open: the change counter, and the number of rows.
+    [[nodiscard]] std::uint64_t counter() const { return counter_; }
+    [[nodiscard]] std::uint64_t count() const { return rows_; }
+
     // Reads the row at a position among the committed rows; false behind the last.
     bool read(std::uint64_t position, row_values & values) const;
+    // Reads the row with a fixed index, as matching() gives them.
+    void read_fixed(kt_uint32_t row, row_values & values) const;
     // Reads the row with the key; false if there is none.
     bool read_by_key(kt_value_t key, row_values & values) const;
-    // The number of rows.
-    [[nodiscard]] std::uint64_t count() const;
+    // The fixed indices of the rows that the expression is true of. Refuses a wrong one with a picture of the place.
+    [[nodiscard]] std::vector<kt_uint32_t> matching(const std::string & expression) const;
 
     // Returns the code of the registry, since the caller knows which of its rows it was.
     [[nodiscard]] kt_int32_t add(const std::vector<kt_char_ptr_t> & names,
@@ -77,6 +83,10 @@ class table
     [[nodiscard]] bool       contains(kt_value_t key) const;
     // Deletes the row at a position. Positions stay what they are until the commit.
     void delete_at(std::uint64_t position) const;
+    // Deletes the rows that the expression is true of, and returns how many.
+    [[nodiscard]] std::size_t delete_matching(const std::string & expression) const;
+    // Deletes them all.
+    void delete_all() const;
 
     // Makes all that is pending permanent, in one transaction.
     void commit();
@@ -91,12 +101,15 @@ class table
     explicit table(place where) : where_(std::move(where)) {}
     void open_tree();
     void mount();
+    void take_metadata();
     void make(const std::string & registry_path, const std::vector<column> & columns, std::uint64_t expected_rows);
 
     place               where_;
     std::vector<column> columns_;
-    rg_opaque_handle_t  tree_   = nullptr;
-    rg_opaque_handle_t  handle_ = nullptr;
+    std::uint64_t       counter_ = 0;
+    std::uint64_t       rows_    = 0;
+    rg_opaque_handle_t  tree_    = nullptr;
+    rg_opaque_handle_t  handle_  = nullptr;
 };
 
 } // namespace ktrg

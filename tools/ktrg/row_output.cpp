@@ -2,11 +2,6 @@
 // row_output: see its header.
 #include "row_output.h"
 
-#include <fmt/format.h>
-
-#include "failure.h"
-#include "table_file.h"
-
 namespace ktrg
 {
 
@@ -22,17 +17,6 @@ std::vector<column> chosen_columns(const table & from, const std::vector<std::st
     for (const std::string & name : names)
         chosen.push_back(from.columns()[find_column(from.columns(), name, from.where().name)]);
     return chosen;
-}
-
-void check_counter(const table & of)
-{
-    const place & where = of.where();
-    if (!where.counter.has_value())
-        return;
-    const std::uint64_t counter = read_table_file(where.file, where.name).counter;
-    if (counter != *where.counter)
-        throw failure(exit_code::conflict, where.name,
-                      fmt::format("the change counter is {}, not {}: the table has changed", counter, *where.counter));
 }
 
 std::vector<cell> cells_of(const row_values & values, const value_style & style)

@@ -11,9 +11,6 @@ namespace ktrg
 // The named columns, in the order of the names; all that aren't invisible if there are no names.
 [[nodiscard]] std::vector<column> chosen_columns(const table & from, const std::vector<std::string> & names);
 
-// Refuses a table whose change counter isn't the one that TABLE@COUNTER demands.
-void check_counter(const table & of);
-
 [[nodiscard]] std::vector<cell> cells_of(const row_values & values, const value_style & style);
 
 class row_output

@@ -30,8 +30,7 @@ exit_code run_get(const common_options & common, const get_options & options)
     constexpr std::size_t few    = 4;
     const place           where  = find_place(options.table);
     const table           opened = table::open_for_reading(where, options.keys.size() > few);
-    check_counter(opened);
-    row_values values(chosen_columns(opened, options.columns));
+    row_values            values(chosen_columns(opened, options.columns));
 
     value_arena             arena;
     std::vector<kt_value_t> keys; // all are understood before the first row is shown

@@ -66,18 +66,25 @@ std::size_t delete_by_keys(const common_options & common, const table & from, co
 
 std::size_t delete_all(const table & from)
 {
-    const std::uint64_t rows = from.count();
-    for (std::uint64_t position = 0; position < rows; position++) {
-        stop_if_interrupted();
-        from.delete_at(position);
-    }
-    return rows;
+    if (from.count() != 0)
+        from.delete_all();
+    return from.count();
+}
+
+std::size_t delete_rows(const common_options & common, const table & from, const rm_options & options)
+{
+    if (options.all)
+        return delete_all(from);
+    if (options.where.has_value())
+        return from.delete_matching(*options.where);
+    return delete_by_keys(common, from, options.keys);
 }
 
 void refuse_wrong_options(const common_options & common, const rm_options & options, const place & where)
 {
-    if (options.all == !options.keys.empty())
-        throw failure(exit_code::usage, where.name, "rm wants either keys or --all");
+    const int ways = (options.all ? 1 : 0) + (options.where.has_value() ? 1 : 0) + (options.keys.empty() ? 0 : 1);
+    if (ways != 1)
+        throw failure(exit_code::usage, where.name, "rm wants keys, or --where EXPR, or --all");
     if (options.all && !common.force)
         throw failure(exit_code::usage, where.name, "--all deletes every row; --force says that this is meant");
 }
@@ -90,7 +97,7 @@ exit_code run_rm(const common_options & common, const rm_options & options)
     refuse_wrong_options(common, options, where);
     note_interrupts();
     table             from    = table::open_for_writing(where, common.wait_seconds);
-    const std::size_t deleted = options.all ? delete_all(from) : delete_by_keys(common, from, options.keys);
+    const std::size_t deleted = delete_rows(common, from, options);
     if (deleted != 0)
         from.finish(common.dry_run);
     if (!common.quiet)

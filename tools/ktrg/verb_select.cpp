@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <optional>
 
 #include <fmt/format.h>
 
@@ -18,21 +19,32 @@ namespace ktrg
 namespace
 {
 
-// Which rows, by their positions. Without an expression it is all of them, and nothing is kept.
+// Which rows: those that match the expression, or all of them, of which no list is made.
 class row_source
 {
   public:
-    explicit row_source(const table & from) : from_(from) {}
+    row_source(const table & from, const std::optional<std::string> & expression) : from_(from), all_(!expression)
+    {
+        if (expression.has_value())
+            matches_ = from.matching(*expression);
+    }
     bool next(row_values & values)
     {
         stop_if_interrupted();
-        return from_.read(position_++, values);
+        if (all_)
+            return from_.read(position_++, values);
+        if (position_ == matches_.size())
+            return false;
+        from_.read_fixed(matches_[position_++], values);
+        return true;
     }
-    [[nodiscard]] std::uint64_t count() const { return from_.count(); }
+    [[nodiscard]] std::uint64_t count() const { return all_ ? from_.count() : matches_.size(); }
 
   private:
-    const table & from_;
-    std::uint64_t position_ = 0;
+    const table &            from_;
+    bool                     all_;
+    std::vector<kt_uint32_t> matches_;
+    std::uint64_t            position_ = 0;
 };
 
 struct sort_column {
@@ -142,13 +154,12 @@ exit_code run_select(const common_options & common, const select_options & optio
     const place        where  = find_place(options.table);
     const table        opened = table::open_for_reading(where);
     const output_style style  = common.style_or(output_form::table);
-    check_counter(opened);
 
     std::vector<column>            shown = chosen_columns(opened, options.columns);
     std::vector<column>            read  = shown;
     const std::vector<sort_column> order = sort_columns(opened, options.sort, read);
     const std::size_t              limit = options.limit.value_or(SIZE_MAX);
-    row_source                     source(opened);
+    row_source                     source(opened, options.expression);
     if (options.count)
         return write_count(style, std::min<std::uint64_t>(source.count(), limit));
 

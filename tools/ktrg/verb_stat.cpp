@@ -2,7 +2,7 @@
 // ktrg stat: what a table's file is made of, and what the table costs once open.
 //
 // The figures of the file come from our own walk over its records, those of the open table from the library: that the
-// two agree on the number of rows is a check in itself.
+// two agree on the number of rows is checked.
 #include <algorithm>
 #include <cstring>
 #include <map>
@@ -30,6 +30,7 @@ struct figure {
 
 struct open_figures {
     std::uint64_t rows          = 0;
+    std::uint64_t counter       = 0;
     std::uint64_t memory        = 0;
     std::uint64_t buckets       = 0;
     std::uint64_t longest_chain = 0;
@@ -49,6 +50,7 @@ open_figures figures_of_open(const place & where, std::uint64_t expected_rows)
     const table         opened = table::open_for_reading(where, true);
     const std::uint64_t after  = memory_in_use();
     result.memory              = after > before ? after - before : 0;
+    result.counter             = opened.counter();
 
     const column   key  = opened.columns().front();
     const key_hash hash = key_hash_for(key.type, expected_rows);
@@ -127,9 +129,12 @@ void write_text(output_sink & sink, const output_style & style, const std::vecto
 
 exit_code run_stat(const common_options & common, const table_options & options)
 {
-    const place         where   = find_place(options.table);
-    const table_file    file    = read_table_file(where.file, where.name);
-    const open_figures  opened  = figures_of_open(where, file.rows);
+    const place        where  = find_place(options.table);
+    const table_file   file   = read_table_file(where.file, where.name);
+    const open_figures opened = figures_of_open(where, file.rows);
+    if (opened.rows != file.rows && opened.counter == file.counter)
+        throw failure(exit_code::damaged, where.name,
+                      fmt::format("the file's records make {} rows, the open table has {}", file.rows, opened.rows));
     std::vector<figure> figures = figures_of(where, file, opened);
     output_sink         sink;
     if (!common.form.has_value()) {

@@ -49,6 +49,7 @@ struct get_options {
 
 struct select_options {
     std::string                table;
+    std::optional<std::string> expression; // none: all rows
     std::vector<std::string>   columns;
     std::vector<std::string>   sort; // column names, with "-" in front for descending order
     std::optional<std::size_t> limit;
@@ -78,9 +79,10 @@ struct put_options {
 };
 
 struct rm_options {
-    std::string              table;
-    std::vector<std::string> keys;
-    bool                     all = false;
+    std::string                table;
+    std::vector<std::string>   keys;
+    std::optional<std::string> where; // an expression
+    bool                       all = false;
 };
 
 [[nodiscard]] exit_code run_ls(const common_options & common, const ls_options & options);
