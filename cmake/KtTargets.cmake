@@ -2,12 +2,16 @@
 
 # What everything here is compiled with.
 add_library(kt_options INTERFACE)
+set(kt_sanitizer_noise) # a list of sanitizers has commas, which no generator expression takes
+if(KT_SANITIZE)
+  set(kt_sanitizer_noise -Wno-stringop-overflow -Wno-array-bounds)
+endif()
 target_compile_options(kt_options INTERFACE -Wall -Wextra -Wpedantic -Wconversion $<$<BOOL:${KT_WERROR}>:-Werror>)
 # GCC 12 sees what can't happen in inlined code of its own standard library: uninitialised strings at -O3, and overflows
 # once sanitizers stand between.
 if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
   target_compile_options(kt_options INTERFACE -Wno-maybe-uninitialized
-                                              $<$<BOOL:${KT_SANITIZE}>:-Wno-stringop-overflow$<SEMICOLON>-Wno-array-bounds>)
+                                              ${kt_sanitizer_noise})
 endif()
 if(KT_SANITIZE)
   target_compile_options(kt_options INTERFACE -fsanitize=${KT_SANITIZE} -fno-omit-frame-pointer
