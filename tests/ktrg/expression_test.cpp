@@ -74,7 +74,7 @@ TEST(a_wrong_expression, is_shown_with_a_caret_under_the_place)
     const result rows = at.run({"select", "hosts", "cpus > 4 && nam == \"x\""});
     EXPECT_EQ(rows.code, 2);
     EXPECT_EQ(rows.out, "");
-    EXPECT_EQ(rows.err, "ktrg: hosts: no column named \"nam\" (did you mean \"name\"?) [11]\n"
+    EXPECT_EQ(rows.err, "ktrg: hosts: no column named \"nam\" (did you mean \"name\"?) [105]\n"
                         "  cpus > 4 && nam == \"x\"\n"
                         "              ^\n");
 }

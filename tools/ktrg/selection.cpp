@@ -149,9 +149,10 @@ void check_expression(const std::string & expression, const std::vector<column> 
     }
     if (code == KU_EXPR_E_NO_MEMORY)
         throw failure(exit_code::input_output, table_name, "out of memory", RG_E_NO_MEMORY);
-    const diagnosis   what = parse_diagnosis(ku_expr_diagnosis_1());
-    const std::string hint = code == KU_EXPR_E_NO_SUCH_NAME ? hint_for(what, columns) : std::string();
-    throw failure(exit_code::usage, table_name, what.text + hint, RG_E_LIBRARY_CALL)
+    const diagnosis what    = parse_diagnosis(ku_expr_diagnosis_1());
+    const bool      unknown = code == KU_EXPR_E_NO_SUCH_NAME;
+    throw failure(exit_code::usage, table_name, what.text + (unknown ? hint_for(what, columns) : std::string()),
+                  unknown ? RG_E_INVALID_COLUMN : RG_E_LIBRARY_CALL)
         .with_detail(what.column == 0 ? std::string() : picture(expression, what));
 }
 
