@@ -1,0 +1,32 @@
+// SPDX-License-Identifier: MIT
+// workloads: what is measured, by name.
+#ifndef PEERS_WORKLOADS_H
+#define PEERS_WORKLOADS_H
+
+#include <span>
+#include <string>
+#include <string_view>
+
+namespace peers
+{
+
+enum class unit { nanoseconds, bytes, times, gigabytes_a_second };
+
+struct workload {
+    const char * name;
+    unit         in;
+    const char * per; // what one figure is the cost of
+    const char * meaning;
+};
+
+// Those of the stores, in the order in which they are reported.
+std::span<const workload> workloads();
+// What the machine itself can do; measured in the same run.
+std::span<const workload> machine_limits();
+
+// A figure as a person reads it: "412 ns", "1.8 ms", "93 B".
+std::string text_of(double value, unit in);
+
+} // namespace peers
+
+#endif
