@@ -912,6 +912,114 @@ kt_int32_t rg_get_table_metadata_1(rg_opaque_handle_t table_handle, kt_int32_t a
 /* Gives back a description with all that it owns. Returns 0; RG_E_NULL_POINTER for NULL. Takes no lock. */
 kt_int32_t rg_free_table_metadata_1(rg_table_metadata_t * p_metadata);
 
+/* ---- Changing columns ------------------------------------------------------------------------------------------
+ *
+ * A table is never edited in place: each change builds a second table in memory with the new columns and all rows,
+ * rewrites the file from it if there is one, and then the handles show its contents. So a change costs a copy of every
+ * row, with the table locked and the updates of the process waiting, and for a table with a file a rewrite with its
+ * sync. It stands on its own, whatever control the table has: it needs a table with nothing pending or applied, and when
+ * it returns it is committed and counts in the change counter.
+ *
+ * What a caller must know:
+ *   - Rows get new fixed indices: 0, 1, 2 and so on. Packed indices are right only where the table never lost a row,
+ *     and so is finding keys without a hash table, which goes by them: close and open the table, or go by fixed indices.
+ *   - **Of a table with a file, close all handles after a change and open it again before the next update.** The object
+ *     still has the place of the old file's live commit record, and an update that appends writes there, in the middle
+ *     of the new file, which spoils it. Further column changes are safe, since they rewrite.
+ *   - The application's data isn't in the rewritten file until another commit writes it: a reopen before doesn't find it.
+ *   - Of a transient table, adding, renaming and changing a default leave all rows uncommitted, though nothing is
+ *     pending: only reads that ask for uncommitted updates see them, and setting a field of a row and committing brings
+ *     it back. Another such change gives RG_E_ROW_DELETED, and a deletion of columns loses these rows. Deleting columns
+ *     of a table whose rows are committed has no such effect.
+ *
+ * All calls here return 0 or one of these; a failure leaves the table and its file as they were:
+ *   RG_E_INVALID_HANDLE     table_handle is NULL
+ *   RG_E_ACCESS             the table isn't open for writing; or the rewrite file may not be written
+ *   RG_E_UNCOMMITTED_TABLE  a row is changed and not committed, or the table is applied
+ *   RG_E_ROW_DELETED        there are rows that no commit has, as told above
+ *   RG_E_DUPLICATE_KEY      two rows have one key, though it is RG_PRIMARY_KEY: a set field may have made them
+ *   RG_E_LIBRARY_CALL       a value or a default is damaged, or can't be converted
+ *   RG_E_NO_MEMORY          no memory
+ *   RG_E_SYSTEM_CALL, RG_E_FILESYSTEM_FULL_DETAIL  the table's lock fails, or the file can't be rewritten
+ *   RG_E_INTERNAL           in a forked child, without an error record
+ * A failure in building the new table, other than that of a deletion, is told by its code alone: the error record is
+ * cleared (docs/ODDITIES.md).
+ * Thread-safe; the updates of a process run one at a time. See docs/ARCHITECTURE.md, docs/BAD-INPUT.md. */
+
+/* Adds columns behind those that there are. Rows that exist take the columns' defaults.
+ *
+ *   table_handle  the table
+ *   columns       array_count columns, as for rg_create_table_1, none with a key qualifier. The library copies what it
+ *                 keeps, and leaves the array alone
+ *   array_count   0 rewrites the table as it is, and counts as a change
+ *
+ * Returns one of the codes above, or:
+ *   RG_E_NULL_POINTER      columns is NULL
+ *   RG_E_INVALID_COLUMN    a column that no table can have
+ *   RG_E_DUPLICATE_KEY     a column with a key qualifier
+ *   RG_E_DUPLICATE_COLUMN  the name of another column */
+kt_int32_t rg_add_columns_1(rg_opaque_handle_t table_handle, rg_column_t * columns, kt_uint32_t array_count);
+/* Deletes columns with their values. The others keep their order.
+ *
+ *   column_names  array_count names, each of a column that is neither the key nor RG_INVISIBLE, each once
+ *
+ * Returns one of the codes above, or:
+ *   RG_E_NULL_POINTER    column_names or one of them is NULL
+ *   RG_E_NO_COLUMNS      array_count is 0
+ *   RG_E_INVALID_COLUMN  there is no such column, or it can't be deleted, or it stands twice */
+kt_int32_t rg_delete_columns_1(rg_opaque_handle_t table_handle, kt_char_ptr_t * column_names, kt_uint32_t array_count);
+/* Renames a column. Only for tables without an RG_INVISIBLE column.
+ *
+ *   column_name  the column; NULL rewrites the table as it is
+ *   new_name     may be the name that it has
+ *
+ * Returns one of the codes above, or:
+ *   RG_E_NULL_POINTER      new_name is NULL
+ *   RG_E_INVALID_COLUMN    no such column, a new name that no column can have, or a table with an invisible column
+ *   RG_E_DUPLICATE_COLUMN  another column has the name */
+kt_int32_t rg_change_column_name_1(rg_opaque_handle_t table_handle, kt_char_ptr_t column_name, kt_char_ptr_t new_name);
+/* Gives a column another default. Rows that exist keep their values, also those that came from the old default. Only
+ * for tables without an RG_INVISIBLE column.
+ *
+ *   column_name  the column; NULL rewrites the table as it is
+ *   new_value    by the column's type; copied. A NULL pointer stands for the type's empty value
+ *
+ * Returns one of the codes above, or RG_E_INVALID_COLUMN: no such column, or a table with an invisible column. */
+kt_int32_t rg_change_default_value_1(rg_opaque_handle_t table_handle, kt_char_ptr_t column_name, kt_value_t new_value);
+
+/* Gives a column another default at once and in memory, without a rewrite: for rows added from now on, and for whoever
+ * asks for the table's description. It is no pending update: no commit is needed and no abort undoes it, the change
+ * counter stays, and it works on tables that are open for reading. It ends with the table object, unless the table is
+ * rewritten or copied to a file before: that takes the definitions from memory.
+ *
+ *   p_column_name      any column, invisible ones and the key included
+ *   new_default_value  by the column's type; copied. A NULL pointer stands for the type's empty value. A value of a
+ *                      variable-length type may not be longer than the default that it replaces, and a shorter one
+ *                      gives the difference up for good
+ *
+ * Returns 0 or, with the column unchanged:
+ *   RG_E_INVALID_HANDLE     table_handle is NULL
+ *   RG_E_NULL_POINTER       p_column_name is NULL
+ *   RG_E_INVALID_COLUMN     no such column
+ *   RG_E_NO_ROWS_TO_DELETE  the value is too long; the message doesn't tell that (docs/ODDITIES.md)
+ *   RG_E_LIBRARY_CALL       the value can't be stored
+ *   RG_E_TABLE_UNREADABLE   the file that the table was read from is damaged: the default's place belongs to something
+ *                           else too
+ *   RG_E_NO_MEMORY          no memory
+ *   RG_E_SYSTEM_CALL        the table's lock fails
+ *   RG_E_INTERNAL           in a forked child, without an error record
+ * Thread-safe; readers see the old default or the new one, whole. See docs/BAD-INPUT.md. */
+kt_int32_t rg_overlay_memory_default_value_1(rg_opaque_handle_t table_handle, kt_char_ptr_t p_column_name,
+                                             kt_value_t new_default_value);
+/* Gives a standard column other flags, in the same way: RG_PROTECTED, RG_INVISIBLE, RG_SET_TO_DEFAULT_WHEN_UNSPECIFIED.
+ *
+ *   new_qualifier  RG_STANDARD with flags. It is stored as it is
+ *
+ * Returns 0 or, with the column unchanged: RG_E_INVALID_COLUMN if there is no such column, or its kind or the new one
+ * isn't RG_STANDARD; RG_E_INVALID_HANDLE, RG_E_NULL_POINTER, RG_E_SYSTEM_CALL and RG_E_INTERNAL as above. */
+kt_int32_t rg_overlay_memory_column_qualifier_1(rg_opaque_handle_t table_handle, kt_char_ptr_t p_column_name,
+                                                rg_qualifier_t new_qualifier);
+
 /* The list of tables in the shape of an older directory interface. A registry has no directories. */
 typedef kt_uint32_t rg_entry_t;
 enum { RG_TABLE = 1 };

@@ -269,6 +269,9 @@ kt_int32_t               rg_i_close_table(rg_i_table_t * p_table);
                                                     rg_hash_table_t * p_rows_hash_table, rg_i_table_t ** p_table);
 // Exchanges the contents of two table objects, so that the handles on p_table stay good.
 [[nodiscard]] kt_int32_t rg_i_swap_after_metadata_update(rg_i_table_t * p_table, rg_i_table_t * p_new_table);
+// The same in two steps, for who must know ahead of something that can't be undone that the exchange won't fail.
+[[nodiscard]] kt_int32_t rg_i_make_room_for_swap(rg_i_table_t * p_table, const rg_i_table_t * p_new_table);
+void                     rg_i_swap_with_room(rg_i_table_t * p_table, rg_i_table_t * p_new_table);
 [[nodiscard]] kt_int32_t rg_i_create_commit_record(rg_i_application_metadata_t * p_application_metadata,
                                                    kt_uint64_t change_counter, kt_uint32_t * p_commit_record_length,
                                                    kt_char_ptr_t * p_p_commit_record);

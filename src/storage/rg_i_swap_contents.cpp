@@ -89,15 +89,23 @@ void exchange_fields(rg_i_table_t & a, rg_i_table_t & b)
 
 } // namespace
 
-kt_int32_t rg_i_swap_after_metadata_update(rg_i_table_t * p_table, rg_i_table_t * p_new_table)
+kt_int32_t rg_i_make_room_for_swap(rg_i_table_t * p_table, const rg_i_table_t * p_new_table)
 {
-    if (const kt_int32_t rc = grow_packed_index(*p_table, p_new_table->maximum_rows); rc != 0)
-        return rc;
+    return grow_packed_index(*p_table, p_new_table->maximum_rows);
+}
 
-    // Nothing below fails.
+void rg_i_swap_with_room(rg_i_table_t * p_table, rg_i_table_t * p_new_table)
+{
     fit_packed_index(*p_table, p_new_table->maximum_rows);
     drop_pending(*p_table);
     drop_pending(*p_new_table);
     exchange_fields(*p_table, *p_new_table);
+}
+
+kt_int32_t rg_i_swap_after_metadata_update(rg_i_table_t * p_table, rg_i_table_t * p_new_table)
+{
+    if (const kt_int32_t rc = rg_i_make_room_for_swap(p_table, p_new_table); rc != 0)
+        return rc;
+    rg_i_swap_with_room(p_table, p_new_table);
     return 0;
 }

@@ -20,12 +20,13 @@ struct exported_call {
 // Each exported call, given the handle and otherwise good arguments.
 inline const std::vector<exported_call> & all_calls()
 {
-    static kt_char_ptr_t         name   = text("K");
-    static kt_char_ptr_t         path   = text("/t");
-    static kt_char_ptr_t         dir    = text("/tmp");
-    static kt_value_t            value  = uint32(1);
-    static kt_value_t *          values = &value;
-    static rg_column_t           key    = column("K", KT_UINT32, RG_PRIMARY_KEY);
+    static kt_char_ptr_t         name       = text("K");
+    static kt_char_ptr_t         other_name = text("V");
+    static kt_char_ptr_t         path       = text("/t");
+    static kt_char_ptr_t         dir        = text("/tmp");
+    static kt_value_t            value      = uint32(1);
+    static kt_value_t *          values     = &value;
+    static rg_column_t           key        = column("K", KT_UINT32, RG_PRIMARY_KEY);
     static rg_row_state_t        state;
     static kt_uint32_t           index;
     static kt_binary_t           binary{1, {0}};
@@ -37,8 +38,11 @@ inline const std::vector<exported_call> & all_calls()
 
     static const std::vector<exported_call> calls = {
         {"rg_abort_1", 1, true, [](handle_t h) { return rg_abort_1(h); }},
+        {"rg_add_columns_1", 3, true, [](handle_t h) { return rg_add_columns_1(h, nullptr, 0); }},
         {"rg_add_row_1", 5, true, [](handle_t h) { return rg_add_row_1(h, &name, &values, 1); }},
         {"rg_apply_1", 7, true, [](handle_t h) { return rg_apply_1(h, 0); }},
+        {"rg_change_column_name_1", 9, true, [](handle_t h) { return rg_change_column_name_1(h, name, name); }},
+        {"rg_change_default_value_1", 11, true, [](handle_t h) { return rg_change_default_value_1(h, name, value); }},
         {"rg_close_table_1", 13, false, [](handle_t h) { return rg_close_table_1(h); }},
         {"rg_close_tree_1", 15, false, [](handle_t h) { return rg_close_tree_1(h); }},
         {"rg_commit_1", 17, true, [](handle_t h) { return rg_commit_1(h); }},
@@ -49,6 +53,7 @@ inline const std::vector<exported_call> & all_calls()
          [](handle_t h) {
              return rg_create_hashed_key_table_1(h, path, &key, 1, 2, 8, hash_uint32, compare_uint32, &result);
          }},
+        {"rg_delete_columns_1", 27, true, [](handle_t h) { return rg_delete_columns_1(h, &other_name, 1); }},
         {"rg_delete_row_by_index_1", 29, true, [](handle_t h) { return rg_delete_row_by_index_1(h, 0); }},
         {"rg_delete_table_1", 33, true, [](handle_t h) { return rg_delete_table_1(h, path); }},
         {"rg_get_application_metadata_1", 39, false,
@@ -79,6 +84,10 @@ inline const std::vector<exported_call> & all_calls()
         {"rg_open_hashed_key_table_1", 79, false,
          [](handle_t h) { return rg_open_hashed_key_table_1(h, path, 2, 8, hash_uint32, compare_uint32, &result); }},
         {"rg_open_tree_1", 81, false, [](handle_t h) { return rg_open_tree_1(static_cast<handle_t *>(h), 0, 0); }},
+        {"rg_overlay_memory_column_qualifier_1", 83, true,
+         [](handle_t h) { return rg_overlay_memory_column_qualifier_1(h, other_name, RG_STANDARD); }},
+        {"rg_overlay_memory_default_value_1", 85, true,
+         [](handle_t h) { return rg_overlay_memory_default_value_1(h, name, value); }},
         {"rg_repair_tables_1", 87, false, [](handle_t h) { return rg_repair_tables_1(h, &path, 1); }},
         {"rg_set_application_metadata_1", 91, true,
          [](handle_t h) { return rg_set_application_metadata_1(h, &binary); }},

@@ -2,36 +2,13 @@
 // What a table tells about itself.
 #include <cstdlib>
 
-#include "rg_i_table.h"
+#include "schema/columns_kit.h"
 #include "support/faults.h"
-#include "support/registry.h"
 
 namespace
 {
 
 using namespace kt_test;
-
-struct two_fields {
-    kt_uint32_t    number_of_fields = 2;
-    rg_field_def_t fields[2]        = {{KT_INT32, text("first")}, {KT_CHAR_PTR, text("second")}};
-};
-
-// The description, released with the object.
-class description
-{
-  public:
-    description(rg_opaque_handle_t table, kt_int32_t all_metadata)
-    {
-        EXPECT_EQ(rg_get_table_metadata_1(table, all_metadata, &p_), 0) << error_text();
-    }
-    ~description() { EXPECT_EQ(rg_free_table_metadata_1(p_), 0); }
-    description(const description &)                           = delete;
-    description &               operator=(const description &) = delete;
-    const rg_table_metadata_t * operator->() const { return p_; }
-
-  private:
-    rg_table_metadata_t * p_ = nullptr;
-};
 
 std::vector<rg_column_t> columns_with_an_invisible_one()
 {
