@@ -1,19 +1,18 @@
 // SPDX-License-Identifier: MIT
 // ls, schema, stat, get, select, names of tables, the command line, and tables that other processes hold.
-#include <array>
 #include <chrono>
 #include <thread>
 
 #include <csignal>
-#include <fcntl.h>
 #include <nlohmann/json.hpp>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include "failure.h"
+#include "holder.h"
 #include "kt_rg.h"
 #include "program.h"
 
+using ktrg_test::holder;
 using ktrg_test::result;
 using ktrg_test::scratch;
 
@@ -363,43 +362,6 @@ TEST(exit_codes, a_damaged_table_ends_with_4)
 }
 
 // ---- Other processes ----
-
-// A process that holds a table as the library's writers do, until it is let go.
-class holder
-{
-  public:
-    explicit holder(const std::string & path)
-    {
-        std::array<int, 2> ready{};
-        EXPECT_EQ(pipe(ready.data()), 0);
-        pid_ = fork();
-        if (pid_ == 0) {
-            const int fd = open(path.c_str(), O_RDWR);
-            if (fd < 0 || lockf(fd, F_LOCK, 0) != 0 || write(ready[1], "x", 1) != 1)
-                _exit(1);
-            pause();
-            _exit(0);
-        }
-        char byte = 0;
-        EXPECT_EQ(read(ready[0], &byte, 1), 1);
-        close(ready[0]);
-        close(ready[1]);
-    }
-    ~holder() { let_go(); }
-    holder(const holder &)             = delete;
-    holder & operator=(const holder &) = delete;
-    void     let_go()
-    {
-        if (pid_ > 0) {
-            kill(pid_, SIGKILL);
-            waitpid(pid_, nullptr, 0);
-            pid_ = -1;
-        }
-    }
-
-  private:
-    pid_t pid_ = -1;
-};
 
 TEST(a_held_table, is_busy_for_a_writer_at_once)
 {

@@ -1,29 +1,24 @@
 // SPDX-License-Identifier: MIT
-// command_line: verbs and options, by CLI11.
+// command_line: parses with CLI11 and runs the verb. The verbs' own options are declared in verb_options.cpp.
 //
 // The common options stand anywhere, ahead of the verb or behind it. All of CLI11's own exit codes become 2.
 #include "command_line.h"
 
 #include <cstdlib>
-#include <functional>
 #include <map>
-#include <memory>
 #include <new>
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
-#include "verbs.h"
+#include "choices.h"
+#include "settings.h"
 
 namespace ktrg
 {
 
 namespace
 {
-
-// A key such as -5 looks like an option. A mark that no option begins with goes in front of it, and off again before
-// the verb sees it.
-constexpr char number_mark = '\x01';
 
 bool is_negative_number(std::string_view argument)
 {
@@ -36,34 +31,6 @@ void unmark(std::string & text)
     if (!text.empty() && text[0] == number_mark)
         text.erase(0, 1);
 }
-
-CLI::Validator one_of(const std::vector<std::string> & words)
-{
-    // Without the list that CLI11 would repeat in the help.
-    return CLI::IsMember(words).description("");
-}
-
-struct settings {
-    common_options common;
-    std::string    form;
-    std::string    colour    = "auto";
-    std::string    bytes     = "hex";
-    std::string    int64     = "number";
-    std::string    errors    = "text";
-    bool           no_header = false;
-
-    ls_options     ls;
-    table_options  schema;
-    table_options  stat;
-    get_options    get;
-    select_options select;
-    import_options import;
-    create_options create;
-    put_options    put;
-    rm_options     rm;
-
-    std::function<exit_code()> verb;
-};
 
 void add_common_options(CLI::App & app, settings & set)
 {
@@ -90,93 +57,8 @@ void add_common_options(CLI::App & app, settings & set)
     app.add_flag("-n,--dry-run", set.common.dry_run, "Do all but the change itself");
     app.add_flag("-f,--force", set.common.force, "Do what destroys");
     app.add_flag("-q,--quiet", set.common.quiet, "No counts and hints on standard error");
-    app.add_flag("-v,--verbose", set.common.verbose, "More of them");
-}
-
-void add_reading_verbs(CLI::App & app, settings & set)
-{
-    CLI::App * p_ls = app.add_subcommand("ls", "List the tables of a directory")->group("Look");
-    p_ls->add_option("DIR", set.ls.directory, "Directory; $KTRG_ROOT or the current one without it");
-    p_ls->callback([&set] { set.verb = [&set] { return run_ls(set.common, set.ls); }; });
-
-    CLI::App * p_schema = app.add_subcommand("schema", "Show the columns of a table")->group("Look");
-    p_schema->add_option("TABLE", set.schema.table, "Path of the table")->required();
-    p_schema->callback([&set] { set.verb = [&set] { return run_schema(set.common, set.schema); }; });
-
-    CLI::App * p_stat = app.add_subcommand("stat", "Show what a table's file is made of")->group("Look");
-    p_stat->add_option("TABLE", set.stat.table, "Path of the table")->required();
-    p_stat->callback([&set] { set.verb = [&set] { return run_stat(set.common, set.stat); }; });
-
-    CLI::App * p_get = app.add_subcommand("get", "Show rows by their keys")->group("Read");
-    p_get->add_option("TABLE", set.get.table, "Path of the table")->required();
-    p_get->add_option("KEY", set.get.keys, "Keys")->required();
-    p_get->add_option("-c,--columns", set.get.columns, "Columns to show, separated by commas")
-        ->delimiter(',')
-        ->type_name("COL,...")
-        ->allow_extra_args(false);
-    p_get->callback([&set] { set.verb = [&set] { return run_get(set.common, set.get); }; });
-
-    CLI::App * p_select = app.add_subcommand("select", "Show the rows that match an expression, or all")->group("Read");
-    p_select->add_option("TABLE", set.select.table, "Path of the table")->required();
-    p_select->add_option("EXPR", set.select.expression,
-                         "Which rows, as in 'load > 2 && name like \"a%\"'; all without it");
-    p_select->add_option("-c,--columns", set.select.columns, "Columns to show, separated by commas")
-        ->delimiter(',')
-        ->type_name("COL,...")
-        ->allow_extra_args(false);
-    p_select->add_option("-s,--sort", set.select.sort, "Columns to sort by; -COL sorts downwards")
-        ->delimiter(',')
-        ->type_name("COL,...")
-        ->allow_extra_args(false);
-    p_select->add_option("-l,--limit", set.select.limit, "Show so many rows at most")->type_name("N");
-    p_select->add_flag("--count", set.select.count, "Show the number of rows only");
-    p_select->callback([&set] { set.verb = [&set] { return run_select(set.common, set.select); }; });
-}
-
-void add_writing_verbs(CLI::App & app, settings & set)
-{
-    CLI::App * p_import = app.add_subcommand("import", "Add the rows of a file, in one transaction")->group("Write");
-    p_import->add_option("TABLE", set.import.table, "Path of the table")->required();
-    p_import->add_option("FILE", set.import.file, "CSV file; - is standard input")->required();
-    p_import->add_option("--format", set.import.format, "csv or tsv; without it the file's name decides")
-        ->check(one_of({"csv", "tsv"}))
-        ->type_name("FORM");
-    p_import->add_flag("--create", set.import.create, "Make the table, with types that fit the file");
-    p_import->add_option("-k,--key", set.import.key, "The new table's key; the first column without it")
-        ->type_name("COL");
-    p_import
-        ->add_option("-t,--types", set.import.types,
-                     "Types that are not to be detected, as name:type[:flags][=default]")
-
-        ->type_name("COL:TYPE,...")
-        ->allow_extra_args(false);
-    p_import->add_option("--map", set.import.renamed, "The file's column FROM is the table's TO")
-        ->delimiter(',')
-        ->type_name("FROM=TO,...")
-        ->allow_extra_args(false);
-    p_import->callback([&set] { set.verb = [&set] { return run_import(set.common, set.import); }; });
-
-    CLI::App * p_put = app.add_subcommand("put", "Add a row, or update the one with the key")->group("Write");
-    p_put->add_option("TABLE", set.put.table, "Path of the table")->required();
-    p_put->add_option("COL=VAL", set.put.values, "Values; the key's is among them")->required();
-    CLI::Option * p_insert = p_put->add_flag("--insert", set.put.insert, "The row must be new");
-    p_put->add_flag("--update", set.put.update, "The row must exist")->excludes(p_insert);
-    p_put->callback([&set] { set.verb = [&set] { return run_put(set.common, set.put); }; });
-
-    CLI::App * p_rm = app.add_subcommand("rm", "Delete rows, in one transaction")->group("Write");
-    p_rm->add_option("TABLE", set.rm.table, "Path of the table")->required();
-    p_rm->add_option("KEY", set.rm.keys, "Keys of the rows");
-    p_rm->add_option("-w,--where", set.rm.where, "The rows that match an expression")->type_name("EXPR");
-    p_rm->add_flag("--all", set.rm.all, "Every row; needs --force");
-    p_rm->callback([&set] { set.verb = [&set] { return run_rm(set.common, set.rm); }; });
-
-    CLI::App * p_create = app.add_subcommand("create", "Make an empty table")->group("Shape");
-    p_create->add_option("TABLE", set.create.table, "Path of the table")->required();
-    p_create
-        ->add_option("COLUMN", set.create.columns,
-                     "Columns as name:type[:flags][=default], as in id:uint32:key name:string= load:float64")
-        ->required();
-    p_create->callback([&set] { set.verb = [&set] { return run_create(set.common, set.create); }; });
+    app.add_flag("-v,--verbose", set.common.verbose,
+                 "More of them: what is opened and committed, how large it is, how long it took");
 }
 
 bool wants_colour(const std::string & when, bool terminal)
@@ -270,10 +152,7 @@ int run_command_line(int argc, const char * const * argv)
         "Exit codes: 0 done, 1 a plain no, 2 usage, 3 not found, 4 damaged, 5 busy, 6 conflict, 7 input/output,\n"
         "8 not permitted, 10 done in part, 70 internal error, 130 interrupted.");
     add_common_options(app, set);
-    add_reading_verbs(app, set);
-    add_writing_verbs(app, set);
-    for (CLI::App * p_verb : app.get_subcommands([](const CLI::App *) { return true; }))
-        p_verb->footer("The options that all verbs have: `ktrg --help`.");
+    add_verbs(app, set);
 
     std::vector<std::string> arguments;
     for (int i = argc - 1; i > 0; i--) // in reverse, as CLI11 takes a vector
@@ -289,9 +168,14 @@ int run_command_line(int argc, const char * const * argv)
         return static_cast<int>(exit_code::usage);
     }
     finish_settings(set);
+    if (set.common.verbose)
+        be_verbose();
+    const stopwatch time;
     set.common.errors = set.errors == "json" ? error_style::json : error_style::text;
     try {
-        return static_cast<int>(set.verb());
+        const exit_code result = set.verb();
+        tell(fmt::format("{} in all", time.text()));
+        return static_cast<int>(result);
     } catch (const failure & what) {
         print_failure(what, set.common.errors);
         return static_cast<int>(what.exit());

@@ -196,9 +196,4 @@ void print_failure(const failure & what, error_style style)
     std::fputs(line.c_str(), stderr);
 }
 
-void say(std::string_view text)
-{
-    std::fputs(fmt::format("ktrg: {}\n", text).c_str(), stderr);
-}
-
 } // namespace ktrg

@@ -82,7 +82,4 @@ enum class error_style { text, json };
 // Prints `ktrg: subject: text [code]`.
 void print_failure(const failure & what, error_style style);
 
-// Prints a line of talk on standard error: `ktrg: text`.
-void say(std::string_view text);
-
 } // namespace ktrg

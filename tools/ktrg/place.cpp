@@ -62,6 +62,13 @@ bool is_table_file_name(const std::string & file_name)
            std::all_of(file_name.begin(), file_name.end(), is_name_character);
 }
 
+std::string registry_path_at(const std::string & mounted_at, const std::string & file_name)
+{
+    std::string path = mounted_at + "/" + file_name;
+    std::replace(path.begin() + static_cast<std::ptrdiff_t>(mounted_at.size()), path.end(), ',', '/');
+    return path;
+}
+
 place find_place(const std::string & table)
 {
     place             result;
@@ -73,10 +80,8 @@ place find_place(const std::string & table)
     result.directory = slash == std::string::npos ? root_directory() : path.substr(0, std::max<std::size_t>(slash, 1));
     const std::string file_name = slash == std::string::npos ? path : path.substr(slash + 1);
 
-    struct stat status {
-    };
     result.file = result.directory + (result.directory.ends_with('/') ? "" : "/") + file_name;
-    if (file_name.empty() || (stat(result.file.c_str(), &status) == 0 && S_ISDIR(status.st_mode)))
+    if (file_name.empty() || is_directory(result.file))
         throw failure(exit_code::usage, table,
                       fmt::format("a directory, not a table; `ktrg ls {}` lists its tables", path));
     if (!is_table_file_name(file_name))
@@ -84,12 +89,19 @@ place find_place(const std::string & table)
                       "no table can have this name: it is made of letters, digits and \"_\", with \",\" between its "
                       "components",
                       RG_E_INVALID_PATH);
-    result.registry_path = std::string(mount_point) + "/" + file_name;
-    std::replace(result.registry_path.begin(), result.registry_path.end(), ',', '/');
+    result.file_name     = file_name;
+    result.registry_path = registry_path_at(mount_point, file_name);
     return result;
 }
 
-std::vector<std::string> tables_in(const std::string & directory)
+bool is_directory(const std::string & path)
+{
+    struct stat status {
+    };
+    return stat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+}
+
+std::vector<std::string> files_in(const std::string & directory)
 {
     DIR * p_directory = opendir(directory.c_str());
     if (p_directory == nullptr) {
@@ -100,13 +112,19 @@ std::vector<std::string> tables_in(const std::string & directory)
         throw failure(exit_code::input_output, directory, std::strerror(errno), RG_E_SYSTEM_CALL);
     }
     std::vector<std::string> names;
-    while (const dirent * p_entry = readdir(p_directory)) {
-        const std::string name = p_entry->d_name;
-        if (is_table_file_name(name) && looks_like_table(directory + "/" + name))
-            names.push_back(name);
-    }
+    while (const dirent * p_entry = readdir(p_directory))
+        names.emplace_back(p_entry->d_name);
     closedir(p_directory);
     std::sort(names.begin(), names.end());
+    return names;
+}
+
+std::vector<std::string> tables_in(const std::string & directory)
+{
+    std::vector<std::string> names = files_in(directory);
+    std::erase_if(names, [&directory](const std::string & name) {
+        return !is_table_file_name(name) || !looks_like_table(directory + "/" + name);
+    });
     return names;
 }
 

@@ -5,23 +5,20 @@
 #include "registry.h"
 
 #include <cerrno>
-#include <chrono>
 #include <cstdarg>
 #include <cstdlib>
 #include <cstring>
-#include <thread>
 #include <utility>
 
-#include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include "failure.h"
-#include "interrupt.h"
+#include "hold.h"
 #include "key_hash.h"
 #include "selection.h"
 #include "table_file.h"
+#include "talk.h"
 #include "values.h"
 
 namespace ktrg
@@ -29,21 +26,6 @@ namespace ktrg
 
 namespace
 {
-
-// The library's parameters are not const, though it changes none of these.
-kt_char_ptr_t writable(const std::string & text)
-{
-    return const_cast<kt_char_ptr_t>(text.c_str());
-}
-
-void check(kt_int32_t code, const place & where, std::string_view context = {})
-{
-    if (code == 0)
-        return;
-    if (code == RG_E_NO_SUCH_TABLE)
-        throw no_such_table(where);
-    throw registry_failure(code, where.name, context);
-}
 
 // About so many rows as a file of the length can hold.
 std::uint64_t rows_for(const std::string & file, std::size_t columns)
@@ -53,38 +35,6 @@ std::uint64_t rows_for(const std::string & file, std::size_t columns)
     if (stat(file.c_str(), &status) != 0)
         return 0;
     return static_cast<std::uint64_t>(status.st_size) / (16 + 8 * columns);
-}
-
-// Whether another process holds the file. Our descriptor is closed again before the library opens its own, so that no
-// lock of ours goes with it.
-bool is_held(const place & where)
-{
-    const int fd = open(where.file.c_str(), O_RDWR | O_CLOEXEC);
-    if (fd < 0) {
-        if (errno == ENOENT)
-            throw no_such_table(where);
-        if (errno == EACCES || errno == EPERM || errno == EROFS)
-            throw failure(exit_code::not_permitted, where.name,
-                          errno == EROFS ? "the file system is read-only" : "permission denied", RG_E_ACCESS);
-        throw failure(exit_code::input_output, where.name, std::strerror(errno), RG_E_SYSTEM_CALL);
-    }
-    const bool held = lockf(fd, F_TEST, 0) != 0 && (errno == EACCES || errno == EAGAIN);
-    close(fd);
-    return held;
-}
-
-void wait_while_held(const place & where, double wait_seconds)
-{
-    using clock         = std::chrono::steady_clock;
-    const auto deadline = clock::now() + std::chrono::duration<double>(wait_seconds);
-    while (is_held(where)) {
-        stop_if_interrupted();
-        if (clock::now() >= deadline)
-            throw failure(exit_code::busy, where.name,
-                          wait_seconds > 0 ? "another process still holds the table"
-                                           : "another process holds the table; --wait SECONDS waits for it");
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    }
 }
 
 // The library takes the values of the criteria's variables as a list only. Ours have none.
@@ -190,59 +140,69 @@ void row_values::release()
 
 // ---- Opening ----
 
-void table::open_tree()
-{
-    check(rg_open_tree_1(&tree_, 0, 0), where_);
-}
-
-// The library makes a directory that it doesn't find. Here a wrong name is a mistake to be told.
-void table::mount()
-{
-    struct stat status {
-    };
-    if (stat(where_.directory.c_str(), &status) != 0)
-        throw no_such_table(where_);
-    open_tree();
-    check(rg_mount_local_tree_1(tree_, const_cast<kt_char_ptr_t>(mount_point), writable(where_.directory), 0), where_);
-}
-
 // What the open table says of itself is exact, also where a writer came between our look at the file and the open.
 void table::take_metadata()
 {
     constexpr kt_int32_t  all_columns = -1;
     rg_table_metadata_t * p_metadata  = nullptr;
     check(rg_get_table_metadata_1(handle_, all_columns, &p_metadata), where_);
-    counter_ = p_metadata->table_change_counter;
-    rows_    = p_metadata->number_of_rows;
     columns_.clear();
     for (kt_uint32_t i = 0; i < p_metadata->number_of_columns; i++)
         columns_.push_back(column_of(p_metadata->column_definitions[i]));
     rg_free_table_metadata_1(p_metadata);
+    take_counts();
     if (where_.counter.has_value() && counter_ != *where_.counter)
         throw failure(
             exit_code::conflict, where_.name,
             fmt::format("the change counter is {}, not {}: the table has changed", counter_, *where_.counter));
 }
 
+void table::take_counts()
+{
+    rg_table_metadata_t * p_metadata = nullptr;
+    check(rg_get_table_metadata_1(handle_, 0, &p_metadata), where_);
+    counter_ = p_metadata->table_change_counter;
+    rows_    = p_metadata->number_of_rows;
+    rg_free_table_metadata_1(p_metadata);
+}
+
+// Opens the file, with an index of its keys if it can have one. A table that was filled without a check of its keys may
+// hold two that are equal, and can't be indexed then.
+void table::open(kt_int32_t mode, bool hashed)
+{
+    columns_ = read_table_columns(where_.file, where_.name);
+    tree_    = tree(where_);
+    tree_.mount(where_);
+    const key_hash hash = key_hash_for(columns_.front().type, rows_for(where_.file, columns_.size()));
+    kt_int32_t     code = RG_E_DUPLICATE_KEY;
+    if (hashed && hash.buckets != 0)
+        code = rg_open_hashed_key_table_1(tree_.handle(), writable(where_.registry_path), mode, hash.buckets,
+                                          hash.p_hash, hash.p_compare, &handle_);
+    if (code == RG_E_DUPLICATE_KEY)
+        code = rg_open_table_1(tree_.handle(), writable(where_.registry_path), mode, &handle_);
+    check(code, where_);
+}
+
+void table::tell_open(const char * p_what, const stopwatch & time) const
+{
+    struct stat status {
+    };
+    if (verbose() && stat(where_.file.c_str(), &status) == 0)
+        tell(fmt::format("{}: {}: {}, {}, {} bytes, counter {}, {}", where_.name, p_what, counted(rows_, "row"),
+                         counted(columns_.size(), "column"), status.st_size, counter_, time.text()));
+}
+
 table table::open_for_reading(const place & where, bool hashed)
 {
-    table       result(where);
-    struct stat status {
+    table           result(where);
+    const stopwatch time;
+    struct stat     status {
     };
     if (stat(where.file.c_str(), &status) != 0 && errno == ENOENT)
         throw no_such_table(where);
-    result.columns_ = read_table_columns(where.file, where.name);
-    result.mount();
-    const key_hash hash = key_hash_for(result.columns_.front().type, rows_for(where.file, result.columns_.size()));
-    kt_int32_t     code = RG_E_DUPLICATE_KEY;
-    if (hashed && hash.buckets != 0)
-        code = rg_open_hashed_key_table_1(result.tree_, writable(where.registry_path), RG_MODE_READ, hash.buckets,
-                                          hash.p_hash, hash.p_compare, &result.handle_);
-    // A table that was filled without a check of its keys may hold two that are equal, and can't be indexed then.
-    if (code == RG_E_DUPLICATE_KEY)
-        code = rg_open_table_1(result.tree_, writable(where.registry_path), RG_MODE_READ, &result.handle_);
-    check(code, where);
+    result.open(RG_MODE_READ, hashed);
     result.take_metadata();
+    result.tell_open("open for reading", time);
     return result;
 }
 
@@ -252,19 +212,12 @@ table table::open_for_writing(const place & where, double wait_seconds)
     for (int attempt = 0; attempt < attempts; attempt++) {
         wait_while_held(where, wait_seconds);
         table               result(where);
+        const stopwatch     time;
         const file_identity before = identity_of(where.file);
-        result.columns_            = read_table_columns(where.file, where.name);
-        result.mount();
-        const key_hash hash = key_hash_for(result.columns_.front().type, rows_for(where.file, result.columns_.size()));
-        const kt_int32_t mode = RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL;
-        if (hash.buckets != 0)
-            check(rg_open_hashed_key_table_1(result.tree_, writable(where.registry_path), mode, hash.buckets,
-                                             hash.p_hash, hash.p_compare, &result.handle_),
-                  where);
-        else
-            check(rg_open_table_1(result.tree_, writable(where.registry_path), mode, &result.handle_), where);
+        result.open(RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL, true);
         if (identity_of(where.file) == before) {
             result.take_metadata();
+            result.tell_open("open for writing", time);
             return result;
         }
         // Another writer rewrote the table while we opened it: what we hold is its former file.
@@ -281,10 +234,11 @@ void table::make(const std::string & registry_path, const std::vector<column> & 
     const key_hash     hash  = columns_.empty() ? key_hash{} : key_hash_for(columns_.front().type, expected_rows);
     kt_int32_t         code  = 0;
     if (hash.buckets != 0)
-        code = rg_create_hashed_key_table_1(tree_, writable(registry_path), definitions.definitions.data(), count, mode,
-                                            hash.buckets, hash.p_hash, hash.p_compare, &handle_);
+        code = rg_create_hashed_key_table_1(tree_.handle(), writable(registry_path), definitions.definitions.data(),
+                                            count, mode, hash.buckets, hash.p_hash, hash.p_compare, &handle_);
     else
-        code = rg_create_table_1(tree_, writable(registry_path), definitions.definitions.data(), count, mode, &handle_);
+        code = rg_create_table_1(tree_.handle(), writable(registry_path), definitions.definitions.data(), count, mode,
+                                 &handle_);
     if (code == RG_E_DUPLICATE_KEY)
         throw failure(exit_code::usage, where_.name, "two columns are marked as the key", code);
     if (code == RG_E_KEY_EXPECTED)
@@ -299,7 +253,8 @@ table table::create(const place & where, const std::vector<column> & columns, st
     };
     if (stat(where.file.c_str(), &status) == 0)
         throw registry_failure(RG_E_TABLE_EXISTS, where.name);
-    result.mount();
+    result.tree_ = tree(where);
+    result.tree_.mount(where);
     result.make(where.registry_path, columns, expected_rows);
     return result;
 }
@@ -307,14 +262,14 @@ table table::create(const place & where, const std::vector<column> & columns, st
 table table::create_in_memory(const place & where, const std::vector<column> & columns, std::uint64_t expected_rows)
 {
     table result(where);
-    result.open_tree();
+    result.tree_ = tree(where);
     result.make("memory", columns, expected_rows);
     return result;
 }
 
 table::table(table && other) noexcept
     : where_(std::move(other.where_)), columns_(std::move(other.columns_)), counter_(other.counter_),
-      rows_(other.rows_), tree_(std::exchange(other.tree_, nullptr)), handle_(std::exchange(other.handle_, nullptr))
+      rows_(other.rows_), tree_(std::move(other.tree_)), handle_(std::exchange(other.handle_, nullptr))
 {
 }
 
@@ -327,15 +282,20 @@ void table::close()
 {
     if (handle_ != nullptr)
         rg_close_table_1(std::exchange(handle_, nullptr));
-    if (tree_ != nullptr)
-        rg_close_tree_1(std::exchange(tree_, nullptr));
+    tree_.close();
+}
+
+// While we hold its lock, so that no other writer gets hold of it in between.
+void table::drop()
+{
+    check(rg_delete_table_1(tree_.handle(), writable(where_.registry_path)), where_);
+    close();
 }
 
 void table::remove()
 {
-    // While we hold its lock, so that no other writer gets hold of it in between.
-    if (tree_ != nullptr)
-        rg_delete_table_1(tree_, writable(where_.registry_path));
+    if (tree_.handle() != nullptr)
+        rg_delete_table_1(tree_.handle(), writable(where_.registry_path));
     close();
 }
 
@@ -447,8 +407,13 @@ void table::finish(bool dry_run)
 
 void table::commit()
 {
+    const stopwatch time;
     check(rg_apply_1(handle_, 0), where_);
     check(rg_commit_1(handle_), where_);
+    if (!verbose())
+        return;
+    take_counts();
+    tell_open("committed", time);
 }
 
 } // namespace ktrg

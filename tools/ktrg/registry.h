@@ -2,9 +2,8 @@
 // registry: the library's trees and tables with an owner, and failures instead of codes.
 //
 // A tree of ours mounts one directory at place.h's mount point. Reading opens read-only, takes no lock and never waits.
-// Writing asks first whether another process holds the table, since the library's own open would wait for it without an
-// end; and it makes sure that the file it got is still the table's, for a writer may have put a new file in its place
-// while we waited.
+// Writing asks first whether another process holds the table (hold.h), and makes sure that the file it got is still the
+// table's, for a writer may have put a new file in its place while we waited.
 #pragma once
 
 #include <cstdint>
@@ -13,7 +12,8 @@
 
 #include "columns.h"
 #include "kt_rg.h"
-#include "place.h"
+#include "talk.h"
+#include "tree.h"
 
 namespace ktrg
 {
@@ -59,8 +59,9 @@ class table
     [[nodiscard]] const place &               where() const { return where_; }
     [[nodiscard]] const std::vector<column> & columns() const { return columns_; }
     [[nodiscard]] rg_opaque_handle_t          handle() const { return handle_; }
+    [[nodiscard]] const tree &                tree_of() const { return tree_; }
 
-    // As of the open: the change counter, and the number of rows.
+    // The change counter, and the number of rows, as of the open.
     [[nodiscard]] std::uint64_t counter() const { return counter_; }
     [[nodiscard]] std::uint64_t count() const { return rows_; }
 
@@ -94,22 +95,25 @@ class table
     void finish(bool dry_run);
     // Gives the table back. What isn't committed is gone.
     void close();
-    // Closes a table that create() made, and removes its file.
+    // Removes the table's file, and closes it.
+    void drop();
+    // The same for a table that create() made, in a failure that matters more than this one.
     void remove();
 
   private:
     explicit table(place where) : where_(std::move(where)) {}
-    void open_tree();
-    void mount();
+    void open(kt_int32_t mode, bool hashed);
     void take_metadata();
+    void take_counts();
+    void tell_open(const char * p_what, const stopwatch & time) const;
     void make(const std::string & registry_path, const std::vector<column> & columns, std::uint64_t expected_rows);
 
     place               where_;
     std::vector<column> columns_;
     std::uint64_t       counter_ = 0;
     std::uint64_t       rows_    = 0;
-    rg_opaque_handle_t  tree_    = nullptr;
-    rg_opaque_handle_t  handle_  = nullptr;
+    tree                tree_;
+    rg_opaque_handle_t  handle_ = nullptr;
 };
 
 } // namespace ktrg

@@ -9,6 +9,7 @@
 
 #include "failure.h"
 #include "output.h"
+#include "talk.h"
 
 namespace ktrg
 {
@@ -56,6 +57,15 @@ struct select_options {
     bool                       count = false;
 };
 
+struct copy_options {
+    std::string source;
+    std::string target; // a table, or a directory for one of the same name
+};
+
+struct tables_options {
+    std::vector<std::string> tables;
+};
+
 struct import_options {
     std::string              table;
     std::string              file;
@@ -94,5 +104,9 @@ struct rm_options {
 [[nodiscard]] exit_code run_create(const common_options & common, const create_options & options);
 [[nodiscard]] exit_code run_put(const common_options & common, const put_options & options);
 [[nodiscard]] exit_code run_rm(const common_options & common, const rm_options & options);
+[[nodiscard]] exit_code run_cp(const common_options & common, const copy_options & options);
+[[nodiscard]] exit_code run_mv(const common_options & common, const copy_options & options);
+[[nodiscard]] exit_code run_drop(const common_options & common, const tables_options & options);
+[[nodiscard]] exit_code run_repair(const common_options & common, const tables_options & options);
 
 } // namespace ktrg

@@ -1,0 +1,217 @@
+// SPDX-License-Identifier: MIT
+// verb_options: the verbs as the command line knows them: their arguments, options, and examples for their help. A
+// function each; to add a verb, add one here and its run_... in a file of its own.
+#include <CLI/CLI.hpp>
+#include <fmt/format.h>
+
+#include "choices.h"
+#include "settings.h"
+
+namespace ktrg
+{
+
+namespace
+{
+
+using lines = std::vector<const char *>;
+
+// A verb whose callback notes that it is the one to run. Its help ends with examples, and details ahead of them.
+template <class Options>
+CLI::App * add_verb(CLI::App & app, settings & set, const char * p_name, const char * p_group, const char * p_about,
+                    exit_code (*run)(const common_options &, const Options &), const Options & options,
+                    const lines & examples, const lines & details = {})
+{
+    CLI::App *  p_verb = app.add_subcommand(p_name, p_about)->group(p_group);
+    std::string footer;
+    for (const char * p_detail : details)
+        footer += fmt::format("{}\n", p_detail);
+    footer += fmt::format("{}{}:\n", details.empty() ? "" : "\n", examples.size() == 1 ? "Example" : "Examples");
+    for (const char * p_example : examples)
+        footer += fmt::format("  ktrg {}\n", p_example);
+    p_verb->footer(footer + "\nThe options that all verbs have: `ktrg --help`.");
+    p_verb->callback([&set, run, &options] { set.verb = [&set, run, &options] { return run(set.common, options); }; });
+    return p_verb;
+}
+
+void add_table(CLI::App & verb, std::string & table)
+{
+    verb.add_option("TABLE", table, "Path of the table")->required();
+}
+
+// A list such as `a,b`, which may be given several times.
+CLI::Option * add_list(CLI::App & verb, const char * p_flags, std::vector<std::string> & list, const char * p_about,
+                       const char * p_what)
+{
+    return verb.add_option(p_flags, list, p_about)->delimiter(',')->type_name(p_what)->allow_extra_args(false);
+}
+
+// ---- Look ----
+
+void add_ls(CLI::App & app, settings & set)
+{
+    CLI::App * p_verb =
+        add_verb(app, set, "ls", "Look", "List the tables of a directory", run_ls, set.ls, {"ls state", "ls -o json"});
+    p_verb->add_option("DIR", set.ls.directory, "Directory; $KTRG_ROOT or the current one without it");
+}
+
+void add_schema(CLI::App & app, settings & set)
+{
+    add_table(*add_verb(app, set, "schema", "Look", "Show the columns of a table", run_schema, set.schema,
+                        {"schema state/hosts", "create copy $(ktrg schema state/hosts)"}),
+              set.schema.table);
+}
+
+void add_stat(CLI::App & app, settings & set)
+{
+    add_table(*add_verb(app, set, "stat", "Look", "Show what a table's file is made of", run_stat, set.stat,
+                        {"stat state/hosts"}),
+              set.stat.table);
+}
+
+// ---- Read ----
+
+void add_get(CLI::App & app, settings & set)
+{
+    CLI::App * p_verb = add_verb(app, set, "get", "Read", "Show rows by their keys", run_get, set.get,
+                                 {"get state/hosts alpha beta --columns name,load"});
+    add_table(*p_verb, set.get.table);
+    p_verb->add_option("KEY", set.get.keys, "Keys")->required();
+    add_list(*p_verb, "-c,--columns", set.get.columns, "Columns to show, separated by commas", "COL,...");
+}
+
+void add_select(CLI::App & app, settings & set)
+{
+    CLI::App * p_verb =
+        add_verb(app, set, "select", "Read", "Show the rows that match an expression, or all", run_select, set.select,
+                 {"select state/hosts 'load > 2' --sort -load --limit 10", "select state/hosts --count"});
+    add_table(*p_verb, set.select.table);
+    p_verb->add_option("EXPR", set.select.expression,
+                       "Which rows, as in 'load > 2 && name like \"a%\"'; all without it");
+    add_list(*p_verb, "-c,--columns", set.select.columns, "Columns to show, separated by commas", "COL,...");
+    add_list(*p_verb, "-s,--sort", set.select.sort, "Columns to sort by; -COL sorts downwards", "COL,...");
+    p_verb->add_option("-l,--limit", set.select.limit, "Show so many rows at most")->type_name("N");
+    p_verb->add_flag("--count", set.select.count, "Show the number of rows only");
+}
+
+// ---- Write ----
+
+void add_import(CLI::App & app, settings & set)
+{
+    import_options & options = set.import;
+    CLI::App * p_verb = add_verb(app, set, "import", "Write", "Add the rows of a file, in one transaction", run_import,
+                                 options, {"import state/hosts hosts.csv --create --key name --types load:float32"});
+    add_table(*p_verb, options.table);
+    p_verb->add_option("FILE", options.file, "CSV file; - is standard input")->required();
+    p_verb->add_option("--format", options.format, "csv or tsv; without it the file's name decides")
+        ->check(one_of({"csv", "tsv"}))
+        ->type_name("FORM");
+    p_verb->add_flag("--create", options.create, "Make the table, with types that fit the file");
+    p_verb->add_option("-k,--key", options.key, "The new table's key; the first column without it")->type_name("COL");
+    p_verb->add_option("-t,--types", options.types, "Types that are not to be detected, as name:type[:flags][=default]")
+        ->type_name("COL:TYPE,...")
+        ->allow_extra_args(false);
+    add_list(*p_verb, "--map", options.renamed, "The file's column FROM is the table's TO", "FROM=TO,...");
+}
+
+void add_put(CLI::App & app, settings & set)
+{
+    CLI::App * p_verb = add_verb(app, set, "put", "Write", "Add a row, or update the one with the key", run_put,
+                                 set.put, {"put state/hosts name=alpha load=0.5"});
+    add_table(*p_verb, set.put.table);
+    p_verb->add_option("COL=VAL", set.put.values, "Values; the key's is among them")->required();
+    CLI::Option * p_insert = p_verb->add_flag("--insert", set.put.insert, "The row must be new");
+    p_verb->add_flag("--update", set.put.update, "The row must exist")->excludes(p_insert);
+}
+
+void add_rm(CLI::App & app, settings & set)
+{
+    CLI::App * p_verb = add_verb(app, set, "rm", "Write", "Delete rows, in one transaction", run_rm, set.rm,
+                                 {"rm state/hosts alpha beta", "rm state/hosts --where 'load > 100' --dry-run"});
+    add_table(*p_verb, set.rm.table);
+    p_verb->add_option("KEY", set.rm.keys, "Keys of the rows");
+    p_verb->add_option("-w,--where", set.rm.where, "The rows that match an expression")->type_name("EXPR");
+    p_verb->add_flag("--all", set.rm.all, "Every row; needs --force");
+}
+
+// ---- Shape: whole tables ----
+
+void add_create(CLI::App & app, settings & set)
+{
+    CLI::App * p_verb = add_verb(app, set, "create", "Shape", "Make an empty table", run_create, set.create,
+                                 {"create state/disks id:uint32:key name:string= size:uint64"});
+    add_table(*p_verb, set.create.table);
+    p_verb
+        ->add_option("COLUMN", set.create.columns,
+                     "Columns as name:type[:flags][=default], as in id:uint32:key name:string= load:float64")
+        ->required();
+}
+
+void add_copy_arguments(CLI::App & verb, copy_options & options)
+{
+    verb.add_option("SOURCE", options.source, "Path of the table")->required();
+    verb.add_option("TARGET", options.target, "Path of the other table, or a directory")->required();
+}
+
+void add_cp(CLI::App & app, settings & set)
+{
+    add_copy_arguments(
+        *add_verb(app, set, "cp", "Shape", "Copy a table", run_cp, set.cp,
+                  {"cp state/hosts state/hosts_before", "cp state/hosts backup/ --force"},
+                  {"The copy has the table's rows, blob and change counter as of its last commit, and no dead bytes.",
+                   "A target that exists needs --force, and is replaced in one step: a reader finds the old table",
+                   "or the new one."}),
+        set.cp);
+}
+
+void add_mv(CLI::App & app, settings & set)
+{
+    add_copy_arguments(
+        *add_verb(app, set, "mv", "Shape", "Give a table another name or directory", run_mv, set.mv,
+                  {"mv state/hosts state/machines", "mv state/hosts archive/"},
+                  {"A target that exists needs --force, and is replaced in one step. In one file system the move as a",
+                   "whole is one step. To another one the table is copied and then removed."}),
+        set.mv);
+}
+
+void add_drop(CLI::App & app, settings & set)
+{
+    add_verb(app, set, "drop", "Shape", "Remove whole tables; needs --force", run_drop, set.drop,
+             {"drop state/hosts --force", "drop state/hosts@1041 --force"},
+             {"All tables are looked at before the first is removed. One that is damaged can be dropped too; what",
+              "doesn't look like a table at all is left alone."})
+        ->add_option("TABLE", set.drop.tables, "Paths of the tables")
+        ->required();
+}
+
+// ---- Care ----
+
+void add_repair(CLI::App & app, settings & set)
+{
+    add_verb(app, set, "repair", "Care", "Remove rewrite files that were left behind", run_repair, set.repair,
+             {"repair state", "repair state/hosts --dry-run"},
+             {"A process that is killed in the middle of a rewrite leaves a file beside the table, NAME.rewrite, which",
+              "nobody reads. The tables themselves need no repair: each stands at its last commit."})
+        ->add_option("PATH", set.repair.tables, "Tables, or directories for all that is in them")
+        ->required();
+}
+
+} // namespace
+
+void add_verbs(CLI::App & app, settings & set)
+{
+    add_ls(app, set);
+    add_schema(app, set);
+    add_stat(app, set);
+    add_get(app, set);
+    add_select(app, set);
+    add_import(app, set);
+    add_put(app, set);
+    add_rm(app, set);
+    add_create(app, set);
+    add_cp(app, set);
+    add_mv(app, set);
+    add_drop(app, set);
+    add_repair(app, set);
+}
+
+} // namespace ktrg
