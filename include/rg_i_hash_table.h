@@ -18,6 +18,7 @@ struct rg_hash_table_t {
     rg_hash_function_t *              p_hash_function;    // NULL: the built-in rule for resource handles
     rg_hash_keys_compare_function_t * p_compare_function;
     rg_hash_table_element_t **        p_elements; // the bucket heads
+    rg_hash_table_element_t *         p_places;   // one a bucket: where the element of an empty bucket is put
 };
 
 static_assert(offsetof(rg_hash_table_element_t, p_key_value) == 8 && offsetof(rg_hash_table_element_t, p_next) == 16);
@@ -37,6 +38,11 @@ kt_int32_t               rg_i_hash_table_close(rg_hash_table_t * p_hash_table);
                                              rg_qualifier_t             qualifier);
 [[nodiscard]] kt_int32_t rg_i_hash_table_get_index(rg_hash_table_t * p_hash_table, kt_char_ptr_t p_key_value,
                                                    kt_uint32_t * row_index, kt_char_ptr_t ** p_p_p_key_value);
+// The same for a caller who goes on to what the row index leads to: entry row_index of an array with entries of so many
+// bytes. It is fetched while the key, which takes as long to arrive, is compared.
+[[nodiscard]] kt_int32_t rg_i_hash_table_get_index_and_fetch(const rg_hash_table_t * p_hash_table,
+                                                             kt_char_ptr_t p_key_value, kt_uint32_t * row_index,
+                                                             const void * p_entries, size_t entry_length);
 [[nodiscard]] kt_int32_t rg_i_hash_table_remove(rg_hash_table_t * p_hash_table, kt_char_ptr_t p_key_value);
 [[nodiscard]] kt_int32_t rg_i_hash_table_remove_element(rg_hash_table_t * p_hash_table, kt_uint32_t hash_index,
                                                         rg_hash_table_element_t * p_hash_table_element);

@@ -16,6 +16,8 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "memory/rg_i_large_pages.h"
+
 #if defined(__SANITIZE_ADDRESS__)
 #include <sanitizer/asan_interface.h>
 #endif
@@ -284,11 +286,78 @@ struct layout_t {
     }
 };
 
+// ---- Where blocks come from ----
+//
+// The blocks of a small pool are allocations of their own. Those of a pool that has grown are carved from pieces of
+// whole large pages: its records are read in any order, and with small pages each look at one would cost a miss of the
+// address cache besides that of the data. A piece grows with the pool, so that little of it lies unused.
+
+constexpr std::size_t grown_pool     = std::size_t{1} << 20;
+constexpr std::size_t largest_piece  = 16 * rg_i_large_page;
+constexpr std::size_t cache_line     = 64;
+constexpr std::size_t blocks_a_piece = 8; // at least: what is left at the end of one is lost
+
+struct block_memory_t {
+    kt_char_ptr_t p_start; // NULL: no memory
+    bool          starts_heap_memory;
+    bool          is_zero;
+};
+
+[[nodiscard]] block_memory_t allocate_block(std::size_t bytes)
+{
+    auto * const p_start = static_cast<kt_char_ptr_t>(std::calloc(1, bytes));
+    if (p_start != nullptr)
+        rg_i_prefer_large_pages(p_start, bytes);
+    return {p_start, true, true};
+}
+
+std::size_t next_piece_length(const index_t * p_index)
+{
+    const std::size_t wanted = p_index->heap_bytes / 4 / rg_i_large_page * rg_i_large_page;
+    return std::clamp(wanted, rg_i_large_page, largest_piece);
+}
+
+[[nodiscard]] block_memory_t carve_block(index_t * p_index, std::size_t bytes)
+{
+    const bool needs_piece = bytes > p_index->room;
+    if (needs_piece) {
+        const std::size_t length  = next_piece_length(p_index);
+        auto * const      p_piece = static_cast<kt_char_ptr_t>(std::aligned_alloc(rg_i_large_page, length));
+        if (p_piece == nullptr)
+            return allocate_block(bytes); // memory is short, but may do for this block
+        rg_i_prefer_large_pages(p_piece, length);
+        p_index->p_room = p_piece;
+        p_index->room   = length;
+    }
+    const kt_char_ptr_t p_start = p_index->p_room;
+    const std::size_t   taken   = std::min((bytes + cache_line - 1) / cache_line * cache_line, p_index->room);
+    p_index->p_room += taken;
+    p_index->room -= taken;
+    return {p_start, needs_piece, false};
+}
+
+[[nodiscard]] block_memory_t find_block_memory(index_t * p_index, std::size_t bytes)
+{
+    if (p_index == nullptr || p_index->heap_bytes < grown_pool || bytes > next_piece_length(p_index) / blocks_a_piece)
+        return allocate_block(bytes);
+    return carve_block(p_index, bytes);
+}
+
 // ---- The tree of blocks ----
+
+block_t * index_behind(rg_i_record_buffer_t * p_block)
+{
+    return reinterpret_cast<block_t *>(reinterpret_cast<kt_char_ptr_t>(p_block) +
+                                       layout_t::offset_of_index(p_block->total_bytes));
+}
 
 block_t * block_at(const node_t & node)
 {
-    return reinterpret_cast<block_t *>(node.p_start + layout_t::offset_of_index(node.total_bytes));
+    auto * const p_index = node.p_start + layout_t::offset_of_index(node.total_bytes);
+    // What stands behind a block is read one thing after the other: have it come at once.
+    for (std::size_t line = 0; line < 3; ++line)
+        __builtin_prefetch(p_index + line * cache_line);
+    return reinterpret_cast<block_t *>(p_index);
 }
 
 void correct_subtree_bound(node_t * p_nodes, kt_uint32_t n)
@@ -439,22 +508,26 @@ rg_i_block_index_t * rg_i_make_indexed_block(rg_i_free_record_index_t ** p_p_ind
     const bool first_of_pool = *p_p_index == nullptr;
     if (!first_of_pool && !make_room_for_a_node(*p_p_index))
         return nullptr;
-    const layout_t layout(total_bytes);
-    auto * const   p_start =
-        static_cast<kt_char_ptr_t>(std::calloc(1, layout.root + (first_of_pool ? sizeof(index_t) : 0)));
-    if (p_start == nullptr)
+    const layout_t       layout(total_bytes);
+    const std::size_t    bytes  = layout.root + (first_of_pool ? sizeof(index_t) : 0);
+    const block_memory_t memory = find_block_memory(*p_p_index, bytes);
+    if (memory.p_start == nullptr)
         return nullptr;
+
+    // Nothing below fails.
+    const kt_char_ptr_t p_start = memory.p_start;
+    if (!memory.is_zero)
+        std::memset(p_start + layout.block_index, 0, bytes - layout.block_index);
 #if defined(__SANITIZE_ADDRESS__)
     const std::size_t readable = std::size_t{total_bytes} + RG_I_RECORD_OVERHANG;
     ASAN_POISON_MEMORY_REGION(p_start + readable, layout.block_index - readable);
 #endif
-
-    // Nothing below fails.
     if (first_of_pool)
         *p_p_index = start_index(p_start + layout.root);
     index_t * const   p_index = *p_p_index;
     const kt_uint32_t n       = p_index->node_count++;
     p_index->p_nodes[n]       = {p_start, total_bytes, none, none, none, 0, 0};
+    p_index->heap_bytes += bytes;
 
     auto * const p_block = reinterpret_cast<block_t *>(p_start + layout.block_index);
     p_block->p_block     = reinterpret_cast<rg_i_record_buffer_t *>(p_start);
@@ -463,9 +536,11 @@ rg_i_block_index_t * rg_i_make_indexed_block(rg_i_free_record_index_t ** p_p_ind
     p_block->p_first     = reinterpret_cast<kt_uint16_t *>(p_start + layout.first);
     p_block->segments    = layout.segments;
     p_block->bounds      = layout.bounds;
-    p_block->clean_from  = RG_I_RECORD_BUFFER_HEAD_LENGTH;
+    p_block->clean_from  = memory.is_zero ? RG_I_RECORD_BUFFER_HEAD_LENGTH : total_bytes;
     p_block->node        = n;
 
+    p_block->starts_heap_memory   = memory.starts_heap_memory;
+    p_block->p_block->p_next      = nullptr;
     p_block->p_block->total_bytes = total_bytes;
     enter_into_tree(p_index, n);
     return p_block;
@@ -475,6 +550,19 @@ void rg_i_drop_index(rg_i_free_record_index_t * p_index)
 {
     if (p_index != nullptr && p_index->p_nodes != p_index->first_nodes)
         std::free(p_index->p_nodes);
+}
+
+void rg_i_free_blocks(rg_i_record_buffer_t * p_first)
+{
+    // A piece is freed when the walk has come to the next one: the blocks carved from it follow its first one.
+    rg_i_record_buffer_t * p_piece = p_first;
+    for (rg_i_record_buffer_t * p_block = p_first; p_block != nullptr; p_block = p_block->p_next) {
+        if (p_block == p_piece || !index_behind(p_block)->starts_heap_memory)
+            continue;
+        std::free(p_piece);
+        p_piece = p_block;
+    }
+    std::free(p_piece);
 }
 
 rg_i_block_index_t * rg_i_block_of(rg_i_free_record_index_t * p_index, const kt_char_t * p_address)

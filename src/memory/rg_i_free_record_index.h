@@ -9,6 +9,8 @@
 // Used by the record pool alone. The pool links and unlinks the records, and tells the index what it did.
 #pragma once
 
+#include <cstddef>
+
 #include "rg_i_record_buffer_pool.h"
 
 struct rg_i_free_record_index_t;
@@ -23,6 +25,7 @@ struct rg_i_block_index_t {
     kt_uint32_t                bounds;     // entries of p_longest; the last one is for the whole block
     kt_uint32_t                clean_from; // from this byte of the block on, it is zero as it came from the heap
     kt_uint32_t                node;       // its place in the tree of blocks
+    bool starts_heap_memory;               // its start is what the heap handed out, for it and the blocks carved behind
 };
 
 // A block in the tree of blocks, which is ordered by address. The nodes lie together, so that going down the tree
@@ -56,6 +59,9 @@ struct rg_i_free_record_index_t {
     kt_uint32_t          root;
     kt_uint32_t          hint_length;
     rg_i_block_index_t * p_recent; // the block that an address was last found in
+    kt_char_ptr_t        p_room;   // what is left of the memory that blocks are carved from
+    std::size_t          room;
+    std::size_t          heap_bytes; // of all blocks, with what stands behind them
     // Where the last search ended: every free record before it is shorter than hint_length. So a search for that length
     // or more can begin there, and a run of allocations from one free record doesn't search at all.
     rg_i_free_place_t hint;
@@ -63,12 +69,14 @@ struct rg_i_free_record_index_t {
     rg_i_block_node_t first_nodes[RG_I_FIRST_BLOCK_NODES];
 };
 
-// Makes a block of total_bytes, zeroed but for its head, with room for the index behind, and enters it, without any
-// free record. A pool that has no index yet (*p_p_index is NULL) gets one with it. NULL: no memory, nothing changed.
+// Makes a block of total_bytes with room for the index behind, and enters it, without any free record. It is zeroed from
+// clean_from on. A pool that has no index yet (*p_p_index is NULL) gets one with it. NULL: no memory, nothing changed.
 [[nodiscard]] rg_i_block_index_t * rg_i_make_indexed_block(rg_i_free_record_index_t ** p_p_index,
                                                            kt_uint32_t                 total_bytes);
 // Ahead of freeing the blocks: frees what the index has beside them. NULL is accepted.
 void rg_i_drop_index(rg_i_free_record_index_t * p_index);
+// Frees the blocks of a whole pool, from its first one on. NULL is accepted.
+void rg_i_free_blocks(rg_i_record_buffer_t * p_first);
 
 // The block that an address lies in, or NULL.
 [[nodiscard]] rg_i_block_index_t * rg_i_block_of(rg_i_free_record_index_t * p_index, const kt_char_t * p_address);

@@ -11,6 +11,7 @@
 #include <utility>
 
 #include "frame/rg_i_trace.h"
+#include "memory/rg_i_free_record_index.h"
 #include "rg_i_record_buffer_pool.h"
 
 struct rg_i_kept_blocks_t {
@@ -22,15 +23,6 @@ namespace
 {
 
 constexpr char module_version[] = "rg_i_kept_blocks 1.0";
-
-void free_blocks(rg_i_record_buffer_t * p_block)
-{
-    while (p_block != nullptr) {
-        rg_i_record_buffer_t * const p_next = p_block->p_next;
-        std::free(p_block);
-        p_block = p_next;
-    }
-}
 
 } // namespace
 
@@ -58,7 +50,7 @@ void rg_i_rb_let_go_of_blocks(rg_i_kept_blocks_t * p_kept_blocks)
     if (p_kept_blocks == nullptr ||
         std::atomic_ref(p_kept_blocks->holders).fetch_sub(1, std::memory_order_acq_rel) != 1)
         return;
-    free_blocks(p_kept_blocks->p_first);
+    rg_i_free_blocks(p_kept_blocks->p_first);
     std::free(p_kept_blocks);
 }
 
@@ -67,7 +59,7 @@ void rg_i_rb_give_up_blocks(rg_i_record_buffer_pool_t * p_record_buffer_pool)
     rg_i_record_buffer_t * const p_first       = std::exchange(p_record_buffer_pool->p_first_record_buffer, nullptr);
     rg_i_kept_blocks_t * const   p_kept_blocks = std::exchange(p_record_buffer_pool->p_kept_blocks, nullptr);
     if (p_kept_blocks == nullptr) {
-        free_blocks(p_first);
+        rg_i_free_blocks(p_first);
     } else {
         p_kept_blocks->p_first = p_first; // only the pool itself writes this, while it still counts as a holder
         rg_i_rb_let_go_of_blocks(p_kept_blocks);

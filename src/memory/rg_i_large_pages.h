@@ -11,12 +11,13 @@
 #include <cstddef>
 #include <cstdint>
 
+inline constexpr std::size_t rg_i_large_page = std::size_t{2} << 20;
+
 inline void rg_i_prefer_large_pages([[maybe_unused]] void * p, [[maybe_unused]] std::size_t length)
 {
 #ifdef MADV_HUGEPAGE
-    constexpr std::uintptr_t large_page = std::uintptr_t{2} << 20;
-    const std::uintptr_t     first      = (reinterpret_cast<std::uintptr_t>(p) + large_page - 1) & ~(large_page - 1);
-    const std::uintptr_t     end        = (reinterpret_cast<std::uintptr_t>(p) + length) & ~(large_page - 1);
+    const std::uintptr_t first = (reinterpret_cast<std::uintptr_t>(p) + rg_i_large_page - 1) & ~(rg_i_large_page - 1);
+    const std::uintptr_t end   = (reinterpret_cast<std::uintptr_t>(p) + length) & ~(rg_i_large_page - 1);
     if (end > first)
         madvise(reinterpret_cast<void *>(first), end - first, MADV_HUGEPAGE);
 #endif

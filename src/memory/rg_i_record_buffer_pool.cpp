@@ -211,6 +211,8 @@ void take_from_lent(pool_t * p_pool, rg_i_block_index_t * p_block, kt_char_ptr_t
     }
     (p_previous == nullptr ? p_pool->p_free_chain : head_at(p_previous)->p_next) = p_rest != nullptr ? p_rest : p_next;
     rg_i_move_hint_after_taking(p_pool->p_free_index, p_record, p_previous, p_rest, p_next);
+    if (p_rest == nullptr)
+        __builtin_prefetch(p_next); // where the next search most likely looks
 }
 
 // ---- Duplication ----

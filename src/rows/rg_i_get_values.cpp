@@ -243,10 +243,10 @@ kt_int32_t rg_i_get_fixed_row_index_for_key(rg_i_table_t * p_table, kt_value_t r
         return rg_i_fail(RG_HERE, RG_E_NULL_POINTER);
 
     if (p_table->p_rows_hash_table != nullptr) {
-        kt_char_ptr_t    p_key         = indirect ? row_key.ptr_char : reinterpret_cast<kt_char_ptr_t>(&row_key);
-        kt_char_ptr_t *  p_p_key_value = nullptr;
+        kt_char_ptr_t    p_key = indirect ? row_key.ptr_char : reinterpret_cast<kt_char_ptr_t>(&row_key);
         const kt_int32_t rc =
-            rg_i_hash_table_get_index(p_table->p_rows_hash_table, p_key, p_fixed_row_index, &p_p_key_value);
+            rg_i_hash_table_get_index_and_fetch(p_table->p_rows_hash_table, p_key, p_fixed_row_index,
+                                                p_table->p_rows_fixed_index, sizeof(rg_i_index_entry_t));
         if (rc == RG_E_NO_SUCH_KEY) // comes without a record
             trace_key_not_found(RG_HERE, p_table->p_name, row_key, key_type);
         return rc;

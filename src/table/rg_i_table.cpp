@@ -225,6 +225,7 @@ kt_int32_t rg_i_establish_rows_index(rg_i_table_t * p_table, kt_uint32_t maximum
     p_table->p_rows_packed_index = static_cast<kt_uint32_t *>(std::calloc(maximum_rows, sizeof(kt_uint32_t)));
     if (p_table->p_rows_packed_index == nullptr)
         return rg_i_fail_no_memory(RG_HERE); // rg_i_close_table frees the other array
+    rg_i_prefer_large_pages(p_table->p_rows_packed_index, maximum_rows * sizeof(kt_uint32_t));
 
     p_table->maximum_rows = maximum_rows;
     free_slots_from(p_table, 0);
@@ -258,6 +259,7 @@ kt_int32_t rg_i_grow_index(rg_i_table_t * p_table, kt_uint32_t total_new_rows)
     void * p_packed_index = std::realloc(p_table->p_rows_packed_index, maximum_rows * sizeof(kt_uint32_t));
     if (p_packed_index == nullptr)
         return rg_i_fail_no_memory(RG_HERE);
+    rg_i_prefer_large_pages(p_packed_index, maximum_rows * sizeof(kt_uint32_t));
     p_table->p_rows_packed_index = static_cast<kt_uint32_t *>(p_packed_index);
 
     const auto old_slots     = reinterpret_cast<std::uintptr_t>(p_table->p_rows_fixed_index);

@@ -127,6 +127,7 @@ extern "C" {
 void *  __real_malloc(size_t);
 void *  __real_calloc(size_t, size_t);
 void *  __real_realloc(void *, size_t);
+void *  __real_aligned_alloc(size_t, size_t);
 char *  __real_strdup(const char *);
 void *  __real_tsearch(const void *, void **, int (*)(const void *, const void *));
 int     __real_open(const char *, int, ...);
@@ -163,6 +164,11 @@ void * __wrap_calloc(size_t count, size_t size)
 void * __wrap_realloc(void * p, size_t size)
 {
     return fails(call::allocation) ? nullptr : __real_realloc(p, size);
+}
+
+void * __wrap_aligned_alloc(size_t alignment, size_t size)
+{
+    return fails(call::allocation) ? nullptr : __real_aligned_alloc(alignment, size);
 }
 
 char * __wrap_strdup(const char * p)

@@ -2,7 +2,8 @@
 // faults: counts the calls that the libraries make into the C library, and makes chosen ones fail.
 //
 // The test programs are linked with --wrap for each of these calls, so every call from the libraries' objects (and from
-// the tests' own) comes through here. Allocations are malloc, calloc, realloc, strdup and tsearch together.
+// the tests' own) comes through here. Allocations are malloc, calloc, realloc, aligned_alloc, strdup
+// and tsearch together.
 #pragma once
 
 #include <cstdint>
