@@ -517,7 +517,7 @@ rg_i_block_index_t * rg_i_make_indexed_block(rg_i_free_record_index_t ** p_p_ind
     // Nothing below fails.
     const kt_char_ptr_t p_start = memory.p_start;
     if (!memory.is_zero)
-        std::memset(p_start + layout.block_index, 0, bytes - layout.block_index);
+        std::memset(p_start + total_bytes, 0, bytes - total_bytes);
 #if defined(__SANITIZE_ADDRESS__)
     const std::size_t readable = std::size_t{total_bytes} + RG_I_RECORD_OVERHANG;
     ASAN_POISON_MEMORY_REGION(p_start + readable, layout.block_index - readable);

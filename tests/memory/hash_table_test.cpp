@@ -128,7 +128,7 @@ TEST(opening_hash_tables, with_functions_keeps_them_and_the_number)
 TEST(opening_hash_tables, without_memory_gives_12_and_leaks_nothing)
 {
     fault_scope faults;
-    for (unsigned nth = 1; nth <= 2; ++nth) {
+    for (unsigned nth = 1; nth <= 3; ++nth) {
         rg_hash_table_t * p_table = nullptr;
         fail_call(call::allocation, nth, ENOMEM);
         EXPECT_EQ(rg_i_hash_table_open(8, first_byte, compare_counted, &p_table), RG_E_NO_MEMORY);
@@ -254,6 +254,46 @@ TEST(adding_keys, without_memory_gives_12_and_changes_nothing)
     EXPECT_EQ(t.rows_in_bucket('a' % 8), (rows{1}));
 }
 
+TEST(adding_keys, the_first_of_a_bucket_needs_no_memory_also_when_the_bucket_has_become_empty_again)
+{
+    fault_scope faults;
+    test_table  t(8, first_byte, compare_counted);
+    fail_call(call::allocation, 1, ENOMEM, kt_test::for_good);
+    for (int round = 0; round < 3; ++round) {
+        ASSERT_EQ(t.add(key("a"), 1), 0);
+        ASSERT_EQ(t.add(key("b"), 2), 0);
+        EXPECT_EQ(t.get(key("a")), 1);
+        ASSERT_EQ(rg_i_hash_table_remove(t.p_table, key("a")), 0);
+        EXPECT_EQ(t.get(key("a")), -RG_E_NO_SUCH_KEY);
+        ASSERT_EQ(rg_i_hash_table_remove(t.p_table, key("b")), 0);
+    }
+}
+
+TEST(adding_keys, in_any_order_of_adding_and_removing_leaves_newest_first)
+{
+    test_table                                                     t(1, hash_as_wanted, compare_counted);
+    std::vector<std::pair<kt_uint32_t, rg_hash_table_element_t *>> expected; // newest first
+    unsigned                                                       state = 1;
+    wanted_bucket                                                        = 0;
+    for (kt_uint32_t row = 0; row < 2000; ++row) {
+        state = state * 1664525u + 1013904223u;
+        if (expected.empty() || state >> 30 < 2) {
+            ASSERT_EQ(t.add(key("k"), row, RG_PRIMARY_KEY_NOCHECK), 0);
+            expected.insert(expected.begin(), {row, t.p_element});
+        } else {
+            const auto it = expected.begin() + static_cast<std::ptrdiff_t>((state >> 8) % expected.size());
+            ASSERT_EQ(rg_i_hash_table_remove_element(t.p_table, 0, it->second), 0);
+            expected.erase(it);
+        }
+        rows left;
+        for (const auto & [kept, p_element] : expected) {
+            left.push_back(kept);
+            ASSERT_EQ(p_element->row_index, kept);
+        }
+        ASSERT_EQ(t.rows_in_bucket(0), left);
+    }
+}
+
 TEST(adding_keys, memory_is_asked_for_ahead_of_the_search_for_a_duplicate)
 {
     fault_scope faults;
@@ -271,6 +311,50 @@ TEST(finding_keys, a_missing_key_gives_202_and_no_error_record)
     EXPECT_EQ(t.get(key("i")), -RG_E_NO_SUCH_KEY);
     EXPECT_EQ(error_code(), 0);
     EXPECT_EQ(t.p_p_key, nullptr);
+}
+
+TEST(finding_keys, for_a_caller_who_goes_on_to_the_row_ends_the_same)
+{
+    test_table    t(8, first_byte, compare_counted);
+    std::uint64_t rows_[4]{};
+    kt_uint32_t   row = 77;
+    ASSERT_EQ(t.add(key("a"), 1), 0);
+    ASSERT_EQ(t.add(key("i"), 3), 0); // same bucket
+    EXPECT_EQ(rg_i_hash_table_get_index_and_fetch(t.p_table, key("a"), &row, rows_, sizeof rows_[0]), 0);
+    EXPECT_EQ(row, 1u);
+    EXPECT_EQ(rg_i_hash_table_get_index_and_fetch(t.p_table, key("q"), &row, rows_, sizeof rows_[0]), RG_E_NO_SUCH_KEY);
+    EXPECT_EQ(error_code(), 0);
+    EXPECT_EQ(row, 1u);
+
+    test_table wrong(8, hash_as_wanted, compare_counted);
+    wanted_bucket = 8;
+    EXPECT_EQ(rg_i_hash_table_get_index_and_fetch(wrong.p_table, key("a"), &row, rows_, sizeof rows_[0]),
+              RG_E_INTERNAL);
+    EXPECT_NE(kt_test::error_text().find("rg_i_hash_table_get_index"), std::string::npos);
+}
+
+// ---- Keys whose records go ahead of their rows ----
+
+TEST(keys_of_their_own, take_the_place_of_the_former_element_wherever_it_stands)
+{
+    for (const std::size_t chosen : {0u, 1u, 2u}) {
+        test_table                             t(8, first_byte, compare_counted);
+        std::vector<std::string>               texts{"a1", "a2", "a3"};
+        std::vector<rg_hash_table_element_t *> elements;
+        for (std::size_t i = 0; i < 3; ++i) {
+            ASSERT_EQ(t.add(texts[i].data(), static_cast<kt_uint32_t>(i)), 0);
+            elements.push_back(t.p_element);
+        }
+        rg_hash_table_element_t * p_element = elements[chosen];
+        ASSERT_EQ(rg_i_hash_table_own_key(t.p_table, 'a' % 8, 3, &p_element), 0);
+        const std::string text = texts[chosen];
+        texts[chosen].assign("??"); // the record goes
+        EXPECT_STREQ(p_element->p_key_value, text.c_str());
+        EXPECT_EQ(t.rows_in_bucket('a' % 8), (rows{2, 1, 0}));
+        EXPECT_EQ(t.get(key(text)), static_cast<std::int64_t>(chosen));
+        ASSERT_EQ(rg_i_hash_table_remove_element(t.p_table, 'a' % 8, p_element), 0);
+        EXPECT_EQ(t.rows_in_bucket('a' % 8).size(), 2u);
+    }
 }
 
 // ---- Removing ----

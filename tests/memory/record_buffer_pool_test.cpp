@@ -646,6 +646,93 @@ TEST(zeroed_room, a_few_bytes_behind_the_last_record_of_a_block_can_be_read_and_
     }
 }
 
+// ---- Pools that have grown ----
+
+namespace
+{
+
+constexpr kt_uint32_t record_of_1000       = 1000; // blocks of 100,032 bytes
+constexpr kt_uint32_t block_of_1000        = 100 * record_of_1000 + 32;
+constexpr kt_uint32_t blocks_of_grown_pool = 60;
+
+void grow(test_pool & pool, kt_uint32_t blocks = blocks_of_grown_pool)
+{
+    while (blocks_of(pool).size() < blocks)
+        std::memset(pool.allocate(record_of_1000), 0xFF, record_of_1000);
+}
+
+} // namespace
+
+TEST(grown_pools, have_blocks_and_counts_as_small_ones_have)
+{
+    test_pool pool;
+    grow(pool);
+    const auto blocks = blocks_of(pool);
+    EXPECT_EQ(pool.total_bytes, blocks_of_grown_pool * block_of_1000);
+    for (rg_i_record_buffer_t * const p_block : blocks)
+        EXPECT_EQ(+p_block->total_bytes, block_of_1000);
+    const chain_t chain = chain_of(pool);
+    EXPECT_TRUE(std::is_sorted(chain.begin(), chain.end()));
+    EXPECT_EQ(pool.used_bytes, used_bytes_by_records(pool));
+}
+
+TEST(grown_pools, ask_the_heap_for_several_blocks_at_once)
+{
+    fault_scope faults;
+    test_pool   pool;
+    grow(pool);
+    const unsigned before = calls_made(call::allocation);
+    grow(pool, 2 * blocks_of_grown_pool);
+    EXPECT_LT(calls_made(call::allocation) - before, blocks_of_grown_pool / 4);
+}
+
+TEST(grown_pools, hand_out_zeros_though_the_heap_does_not)
+{
+    { // what the heap will hand out again
+        test_pool pool;
+        grow(pool);
+    }
+    test_pool pool;
+    for (kt_uint32_t i = 0; i < 20'000; ++i) {
+        const kt_char_ptr_t p_data = pool.allocate(record_of_1000 / 2 + i % 500);
+        ASSERT_TRUE(all_zero(p_data, record_of_1000 / 2));
+        std::memset(p_data, 0xFF, record_of_1000 / 2);
+    }
+    const auto lent = pool.lend(record_of_1000);
+    EXPECT_TRUE(all_zero(lent.p_data + lent.length, RG_I_RECORD_OVERHANG));
+}
+
+TEST(grown_pools, fall_back_to_single_blocks_where_there_is_no_memory_for_several)
+{
+    fault_scope faults;
+    test_pool   pool;
+    grow(pool, 36); // its tree has room for 63
+    bool failed = false;
+    for (kt_uint32_t more = 1; more <= 25 && !failed; ++more) {
+        fail_call(call::allocation, 1, ENOMEM);
+        grow(pool, static_cast<kt_uint32_t>(blocks_of(pool).size() + 1));
+        failed = kt_test::failed_as_asked(call::allocation);
+        kt_test::reset_calls();
+    }
+    EXPECT_TRUE(failed);
+    EXPECT_EQ(pool.used_bytes, used_bytes_by_records(pool));
+}
+
+TEST(grown_pools, are_copied_into_one_block)
+{
+    test_pool pool;
+    grow(pool);
+    kt_char_ptr_t p_data = pool.allocate(100);
+    std::memset(p_data, 'x', 100);
+    test_pool                                   copy;
+    rg_i_record_buffer_pool_duplication_map_t * p_map = nullptr;
+    ASSERT_EQ(rg_i_rb_duplicate_record_buffer_pool(&pool, &copy, &p_map), 0);
+    EXPECT_EQ(copy.total_bytes, pool.total_bytes - 12 * (blocks_of_grown_pool - 1));
+    EXPECT_EQ(std::memcmp(rg_i_rb_map_duplicated_address(p_map, p_data), p_data, 100), 0);
+    EXPECT_EQ(rg_i_rb_free_duplication_map(p_map), 0);
+    EXPECT_EQ(copy.used_bytes, used_bytes_by_records(copy));
+}
+
 TEST(zeroed_room, a_big_block_that_nothing_is_taken_from_costs_no_memory)
 {
     const auto resident_bytes = [] {
@@ -885,6 +972,13 @@ TEST(any_sequence_of_calls, does_what_walking_the_chain_does_in_many_small_block
     model m(21);
     m.run(60000, 4, 5000, 500);
     EXPECT_GT(m.blocks(), 50u);
+}
+
+TEST(any_sequence_of_calls, does_what_walking_the_chain_does_in_a_grown_pool)
+{
+    model m(15);
+    m.run(60000, 999, 6000, 2000);
+    EXPECT_GT(m.blocks(), 20u);
 }
 
 TEST(any_sequence_of_calls, does_what_walking_the_chain_does_in_long_chains)
