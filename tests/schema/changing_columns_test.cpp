@@ -1,48 +1,11 @@
 // SPDX-License-Identifier: MIT
-// Adding, deleting and renaming columns and giving them other defaults: what the rows, the table and its file are
-// afterwards, and what is refused.
-#include <algorithm>
-
+// Adding, deleting and renaming columns and giving them other defaults: what the rows and the table are afterwards, and
+// what is refused.
 #include "schema/columns_kit.h"
 #include "support/trace.h"
 
 namespace kt_test
 {
-
-namespace
-{
-
-// Each change, as one that goes through on the table of three rows.
-struct column_change {
-    const char *                                  name;
-    std::function<kt_int32_t(rg_opaque_handle_t)> make;
-};
-
-const std::vector<column_change> & all_changes()
-{
-    static const std::vector<column_change> changes = {
-        {"add", [](rg_opaque_handle_t t) { return add_columns(t, {column("extra", KT_INT32)}); }},
-        {"delete", [](rg_opaque_handle_t t) { return delete_columns(t, {"val"}); }},
-        {"rename", [](rg_opaque_handle_t t) { return rename_column(t, "val", "value"); }},
-        {"default", [](rg_opaque_handle_t t) { return change_default(t, "val", int64(7)); }},
-    };
-    return changes;
-}
-
-// A failure of the building, which clears the error record on its way.
-void expect_failure_without_record(kt_int32_t expected, kt_int32_t rc)
-{
-    EXPECT_EQ(rc, expected);
-    EXPECT_EQ(error_code(), 0);
-}
-
-void expect_failure(kt_int32_t expected, kt_int32_t rc)
-{
-    EXPECT_EQ(rc, expected);
-    EXPECT_EQ(error_code(), expected);
-}
-
-} // namespace
 
 // ---- What becomes of rows ----
 
@@ -539,7 +502,7 @@ TEST_P(changing_columns, traces_its_entry_the_release_of_the_description_and_its
         for (const event & e : trace.events())
             seen.push_back(e.id);
         const std::uint32_t id        = ids.at(change.name);
-        const bool          describes = change.name != std::string("delete");
+        const bool          describes = !is_deletion(change);
         EXPECT_EQ(seen, describes ? (std::vector<std::uint32_t>{id, 37, 38, id + 1})
                                   : (std::vector<std::uint32_t>{id, id + 1}));
     }

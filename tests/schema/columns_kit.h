@@ -5,6 +5,7 @@
 
 #include <sys/stat.h>
 
+#include <functional>
 #include <map>
 
 #include "support/rows.h"
@@ -68,6 +69,41 @@ inline kt_int32_t overlay_default(rg_opaque_handle_t table, const std::string & 
 inline kt_int32_t overlay_qualifier(rg_opaque_handle_t table, const std::string & name, rg_qualifier_t qualifier)
 {
     return rg_overlay_memory_column_qualifier_1(table, text(name), qualifier);
+}
+
+// Each change, as one that goes through on the table of three rows.
+struct column_change {
+    const char *                                  name;
+    std::function<kt_int32_t(rg_opaque_handle_t)> make;
+};
+
+inline const std::vector<column_change> & all_changes()
+{
+    static const std::vector<column_change> changes = {
+        {"add", [](rg_opaque_handle_t t) { return add_columns(t, {column("extra", KT_INT32)}); }},
+        {"delete", [](rg_opaque_handle_t t) { return delete_columns(t, {"val"}); }},
+        {"rename", [](rg_opaque_handle_t t) { return rename_column(t, "val", "value"); }},
+        {"default", [](rg_opaque_handle_t t) { return change_default(t, "val", int64(7)); }},
+    };
+    return changes;
+}
+
+inline bool is_deletion(const column_change & change)
+{
+    return change.name == std::string("delete");
+}
+
+// A failure of the building, which clears the error record on its way.
+inline void expect_failure_without_record(kt_int32_t expected, kt_int32_t rc)
+{
+    EXPECT_EQ(rc, expected);
+    EXPECT_EQ(error_code(), 0);
+}
+
+inline void expect_failure(kt_int32_t expected, kt_int32_t rc)
+{
+    EXPECT_EQ(rc, expected);
+    EXPECT_EQ(error_code(), expected);
 }
 
 // ---- What a table shows ----
