@@ -1,7 +1,8 @@
-# Compares three lists of names: what the shared library exports, what its version script names, and what its public
-# headers declare.
+# Compares four lists of names: what the shared library exports, what its version script names, what its public headers
+# declare, and what it has promised to export: one name a line. Nothing may be added or lost without that list.
 #
-#   cmake -DNM=<nm> -DLIBRARY=<lib.so> -DMAP=<version script> "-DHEADERS=<header>;..." -P exported_symbols.cmake
+#   cmake -DNM=<nm> -DLIBRARY=<lib.so> -DMAP=<version script> "-DHEADERS=<header>;..." -DNAMES=<list>
+#         -P exported_symbols.cmake
 
 function(read_exported_names library result)
   execute_process(COMMAND ${NM} -D --defined-only ${library} OUTPUT_VARIABLE listing COMMAND_ERROR_IS_FATAL ANY)
@@ -50,7 +51,9 @@ foreach(header IN LISTS HEADERS)
   list(APPEND declared ${names})
 endforeach()
 
-foreach(list IN ITEMS exported mapped declared)
+file(STRINGS ${NAMES} promised)
+
+foreach(list IN ITEMS exported mapped declared promised)
   list(LENGTH ${list} length)
   if(length EQUAL 0)
     message(FATAL_ERROR "found no ${list} names: this check would check nothing")
@@ -60,3 +63,5 @@ compare("exported" "${exported}" "in the version script" "${mapped}")
 compare("in the version script" "${mapped}" "exported" "${exported}")
 compare("declared" "${declared}" "exported" "${exported}")
 compare("exported" "${exported}" "declared" "${declared}")
+compare("promised" "${promised}" "exported" "${exported}")
+compare("exported" "${exported}" "promised" "${promised}")

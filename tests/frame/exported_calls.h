@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: MIT
-// exported_calls: all functions of the interface that take a handle, with their trace ids.
+// exported_calls: all functions of the interface that work on one tree or table, with their trace ids.
 #pragma once
 
+#include <cstdarg>
 #include <functional>
 #include <vector>
 
@@ -17,7 +18,19 @@ struct exported_call {
     std::function<kt_int32_t(rg_opaque_handle_t)> call;
 };
 
-// Each exported call, given the handle and otherwise good arguments.
+// The call that takes a list of arguments, which only a variadic function has.
+inline kt_int32_t get_selected_rows(rg_opaque_handle_t table, kt_char_ptr_t p_criteria, ...)
+{
+    kt_uint32_t   total  = 0;
+    kt_uint32_t * p_rows = nullptr;
+    va_list       ap;
+    va_start(ap, p_criteria);
+    const kt_int32_t rc = rg_get_selected_rows_v_1(table, p_criteria, ap, 0, &total, &p_rows);
+    va_end(ap);
+    return rc;
+}
+
+// Each exported call on one tree or table, given the handle and otherwise good arguments.
 inline const std::vector<exported_call> & all_calls()
 {
     static kt_char_ptr_t         name       = text("K");
@@ -29,6 +42,7 @@ inline const std::vector<exported_call> & all_calls()
     static rg_column_t           key        = column("K", KT_UINT32, RG_PRIMARY_KEY);
     static rg_row_state_t        state;
     static kt_uint32_t           index;
+    static kt_uint32_t *         p_rows;
     static kt_binary_t           binary{1, {0}};
     static kt_binary_t *         p_binary;
     static kt_char_ptr_t *       p_list;
@@ -55,9 +69,12 @@ inline const std::vector<exported_call> & all_calls()
          }},
         {"rg_delete_columns_1", 27, true, [](handle_t h) { return rg_delete_columns_1(h, &other_name, 1); }},
         {"rg_delete_row_by_index_1", 29, true, [](handle_t h) { return rg_delete_row_by_index_1(h, 0); }},
+        {"rg_delete_rows_1", 31, true, [](handle_t h) { return rg_delete_rows_1(h, nullptr); }},
         {"rg_delete_table_1", 33, true, [](handle_t h) { return rg_delete_table_1(h, path); }},
         {"rg_get_application_metadata_1", 39, false,
          [](handle_t h) { return rg_get_application_metadata_1(h, &p_binary); }},
+        {"rg_get_duplicate_rows_1", 41, false,
+         [](handle_t h) { return rg_get_duplicate_rows_1(h, value, &index, &p_rows, 0); }},
         {"rg_get_field_by_fixed_index_and_visibility_1", 43, false,
          [](handle_t h) { return rg_get_field_by_fixed_index_and_visibility_1(h, 0, name, &value, 0, &state); }},
         {"rg_get_field_by_index_1", 45, false, [](handle_t h) { return rg_get_field_by_index_1(h, 0, name, &value); }},
@@ -76,6 +93,8 @@ inline const std::vector<exported_call> & all_calls()
          [](handle_t h) { return rg_get_fields_by_key_1(h, value, &name, &values, 1); }},
         {"rg_get_fields_by_key_and_visibility_1", 61, false,
          [](handle_t h) { return rg_get_fields_by_key_and_visibility_1(h, value, &name, &values, 1, 0, &state); }},
+        {"rg_get_selected_rows_v_1", 63, false, [](handle_t h) { return get_selected_rows(h, nullptr); }},
+        {"rg_get_updated_rows_1", 67, false, [](handle_t h) { return rg_get_updated_rows_1(h, &index, &p_rows); }},
         {"rg_list_tables_1", 69, false, [](handle_t h) { return rg_list_tables_1(h, path, &p_list, &index); }},
         {"rg_mount_local_tree_1", 71, true, [](handle_t h) { return rg_mount_local_tree_1(h, path, dir, 1); }},
         {"rg_move_table_by_handle_1", 73, true, [](handle_t h) { return rg_move_table_by_handle_1(h, path, 0); }},
@@ -89,6 +108,7 @@ inline const std::vector<exported_call> & all_calls()
         {"rg_overlay_memory_default_value_1", 85, true,
          [](handle_t h) { return rg_overlay_memory_default_value_1(h, name, value); }},
         {"rg_repair_tables_1", 87, false, [](handle_t h) { return rg_repair_tables_1(h, &path, 1); }},
+        {"rg_select_1", 89, false, [](handle_t h) { return rg_select_1(h, nullptr, 0, &result, nullptr); }},
         {"rg_set_application_metadata_1", 91, true,
          [](handle_t h) { return rg_set_application_metadata_1(h, &binary); }},
         {"rg_set_field_by_fixed_index_1", 93, true,
