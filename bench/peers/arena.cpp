@@ -78,8 +78,9 @@ void arena::load(layout found_by)
     }
 }
 
-void arena::open(layout found_by, access how)
+void arena::reopen(layout found_by, access how)
 {
+    close();
     each_loaded(0, [&](contestant & c) { c.p_store = c.p_kind->open(place_of(c, found_by), how); });
 }
 

@@ -33,7 +33,7 @@ struct options {
     std::vector<std::string> workloads; // empty: all
     int                      repeat       = 5;
     double                   slice        = 0.03; // seconds that a repetition of a short call goes on
-    double                   patience     = 20;   // a store that would need more seconds to be loaded is left out
+    double                   patience     = 60;   // a store that would need more seconds to be loaded is left out
     int                      transactions = 40;   // durable ones in a repetition
 };
 
@@ -77,7 +77,7 @@ class arena
 
     // Makes each store anew, with all rows in it, and leaves it open for writing. One that would take too long stays out.
     void load(layout found_by);
-    void open(layout found_by, access how); // those that were loaded
+    void reopen(layout found_by, access how = access::read); // those that were loaded
     void close();
     void clear(); // closes them and removes their files
 

@@ -1,10 +1,9 @@
 // SPDX-License-Identifier: MIT
-// by_id: what is measured on one load of rows that lie under their ids. What changes them comes last.
+// by_id: what is measured on one load of rows that lie under their ids. Nothing changes them.
 #include <fmt/format.h>
 
 #include "disk.h"
 #include "groups.h"
-#include "machine.h"
 #include "memory.h"
 #include "reads.h"
 
@@ -85,49 +84,16 @@ void measure_memory(arena & a)
     });
 }
 
-// Beside the stores, and in the same turns, the same system calls without a store.
-void measure_durable(arena & a, const char * p_workload, const std::function<void(contestant &, std::uint64_t)> & act)
-{
-    if (!a.wants({p_workload}))
-        return;
-    const auto    transactions = static_cast<std::size_t>(a.chosen().transactions);
-    std::uint64_t n            = 0;
-    for (int repetition = 0; repetition < a.chosen().repeat; ++repetition, n += transactions) {
-        a.each_loaded(repetition, [&](contestant & c) {
-            a.time(p_workload, c, clock_kind::wall, transactions, [&] {
-                for (std::size_t i = 0; i < transactions; ++i)
-                    act(c, n + i);
-            });
-        });
-        run_fsync_pairs(a);
-    }
-}
-
-void measure_transactions(arena & a)
-{
-    if (!a.wants({"durable_insert", "durable_update"}))
-        return;
-    a.open(layout::by_id, access::write);
-    measure_durable(a, "durable_insert", [&](contestant & c, std::uint64_t n) {
-        const row r = row_of(a.data().size() + n);
-        c.p_store->insert({&r, 1});
-    });
-    measure_durable(a, "durable_update", [&](contestant & c, std::uint64_t n) {
-        const change to{a.data().ids()[n % a.data().size()], 1'000'000};
-        c.p_store->update({&to, 1});
-    });
-    a.close();
-}
-
 } // namespace
 
 void run_by_id(arena & a)
 {
     if (!a.wants({"read_int", "read_int_tx", "read_text", "read_text_tx", "two_threads", "two_threads_gain",
                   "scan_count_1", "scan_count_50", "scan_three", "scan_copy_1", "scan_copy_50", "open_one", "open_all",
-                  "memory_private", "memory_peak", "disk_loaded", "durable_insert", "durable_update"}))
+                  "memory_private", "memory_peak", "disk_loaded"}))
         return;
     a.load(layout::by_id);
+    a.reopen(layout::by_id);
     measure_reads_by_id(a);
     measure_reads_by_two(a);
     measure_scans(a);
@@ -135,7 +101,6 @@ void run_by_id(arena & a)
     measure_disk(a, "disk_loaded");
     measure_opening(a);
     measure_memory(a);
-    measure_transactions(a);
     a.clear();
 }
 

@@ -17,45 +17,13 @@ namespace peers
 namespace
 {
 
+constexpr ssize_t written = 154; // by an apply of one row: its record and a commit record
+
 // Keeps the compiler from leaving out what nobody looks at.
 template <class T> void use(T & value)
 {
     asm volatile("" : "+r,m"(value) : : "memory");
 }
-
-class open_file
-{
-  public:
-    explicit open_file(const std::string & path)
-        : path_(path), fd_(::open(path.c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0644))
-    {
-        require(fd_ >= 0, "can't open " + path);
-    }
-    ~open_file()
-    {
-        ::close(fd_);
-        unlink(path_.c_str());
-    }
-    open_file(const open_file &)             = delete;
-    open_file & operator=(const open_file &) = delete;
-
-    // A row's record and a commit record written at one place, four bytes of the last commit record at another.
-    void pair(off_t rows_at, off_t mark_at)
-    {
-        static char record[130];
-        static char commit[24];
-        const iovec parts[]{{record, sizeof record}, {commit, sizeof commit}};
-        require(lseek(fd_, rows_at, SEEK_SET) == rows_at && writev(fd_, parts, 2) == length && fsync(fd_) == 0 &&
-                    lseek(fd_, mark_at, SEEK_SET) == mark_at && write(fd_, commit, 4) == 4 && fsync(fd_) == 0,
-                "can't write " + path_);
-    }
-
-    static constexpr off_t length = 154;
-
-  private:
-    std::string path_;
-    int         fd_;
-};
 
 void measure_memcpy(arena & a)
 {
@@ -89,6 +57,8 @@ std::vector<std::uint64_t> ring_of(std::size_t cells, std::size_t stride)
 
 void measure_memory_access(arena & a)
 {
+    if (!a.wants({"memory_access"}))
+        return;
     const std::vector<std::uint64_t> ring = ring_of((256u << 20) / 64, 64 / sizeof(std::uint64_t));
     std::uint64_t                    at   = 0;
     for (int repetition = 0; repetition < a.chosen().repeat; ++repetition) {
@@ -114,24 +84,38 @@ template <class Action> void measure_pairs(arena & a, const char * p_limit, Acti
 
 } // namespace
 
-void run_fsync_pairs(arena & a)
+fsync_file::fsync_file(const std::string & path)
+    : path_(path), fd_(open(path.c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0644))
 {
-    open_file file(a.directory() + "/machine");
-    off_t     end = 0;
-    for (; end < 100 * open_file::length; end += open_file::length)
-        file.pair(end, end);
-    const auto transactions = static_cast<std::size_t>(a.chosen().transactions);
-    const auto time_pairs   = [&](const char * p_limit, bool growing) {
-        const double seconds = seconds_of(clock_kind::wall, [&] {
-            for (std::size_t i = 0; i < transactions; ++i) {
-                end += growing ? open_file::length : 0;
-                file.pair(end - open_file::length, end - 2 * open_file::length);
-            }
-        });
-        a.add(p_limit, machine, seconds * 1e9 / static_cast<double>(transactions));
-    };
-    time_pairs("fsync_pair", true);
-    time_pairs("fsync_pair_kept", false);
+    require(fd_ >= 0, "can't open " + path);
+    append_pair();
+}
+
+fsync_file::~fsync_file()
+{
+    close(fd_);
+    unlink(path_.c_str());
+}
+
+void fsync_file::append_pair()
+{
+    pair(end_, end_);
+    end_ += written;
+}
+
+void fsync_file::overwrite_pair()
+{
+    pair(end_ - written, 0);
+}
+
+void fsync_file::pair(off_t rows_at, off_t mark_at)
+{
+    static char record[130];
+    static char commit[written - sizeof record];
+    const iovec parts[]{{record, sizeof record}, {commit, sizeof commit}};
+    require(lseek(fd_, rows_at, SEEK_SET) == rows_at && writev(fd_, parts, 2) == written && fsync(fd_) == 0 &&
+                lseek(fd_, mark_at, SEEK_SET) == mark_at && write(fd_, commit, 4) == 4 && fsync(fd_) == 0,
+            "can't write " + path_);
 }
 
 void run_machine_limits(arena & a)

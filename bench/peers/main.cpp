@@ -12,6 +12,7 @@
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
+#include "charts.h"
 #include "groups.h"
 #include "memory.h"
 #include "report.h"
@@ -35,6 +36,15 @@ bool in_memory(const std::string & directory)
     return statfs(directory.c_str(), &status) == 0 && status.f_type == TMPFS_MAGIC;
 }
 
+constexpr std::pair<const char *, void (*)(arena &)> groups[] = {
+    {"the machine", run_machine_limits},
+    {"transactions of one row", run_durable},
+    {"batches", run_batches},
+    {"by id", run_by_id},
+    {"by name", run_by_name},
+    {"updates", run_updated},
+};
+
 void run(const options & o, const outputs & to)
 {
     if (in_memory(o.directory))
@@ -42,18 +52,20 @@ void run(const options & o, const outputs & to)
     results figures;
     arena   a(o, figures);
     for (const std::size_t size : o.sizes) {
-        fmt::print(stderr, "peers: {} rows\n", size);
         const data_set data(size);
         a.begin(data);
-        run_machine_limits(a);
-        run_batches(a);
-        run_by_id(a);
-        run_by_name(a);
-        run_updated(a);
+        for (const auto & [p_name, run_group] : groups) {
+            const double seconds = seconds_of(clock_kind::wall, [&] { run_group(a); });
+            fmt::print(stderr, "peers: {} rows: {}, {:.1f} s\n", size, p_name, seconds);
+        }
     }
     print_table(figures);
     if (!to.csv.empty())
         write_csv(figures, to.csv);
+    if (!to.markdown.empty())
+        write_markdown(figures, to.markdown);
+    if (!to.svg.empty())
+        write_charts(figures, to.svg);
 }
 
 void list()
@@ -97,6 +109,8 @@ int main_with(int argc, char ** p_argv)
     app.add_flag("--quick", quick, "small and rough");
     app.add_flag("--list", lists, "tell the stores and workloads");
     app.add_option("--csv", to.csv, "write the figures to this file");
+    app.add_option("--markdown", to.markdown, "write the tables of docs/PERFORMANCE.md to this file");
+    app.add_option("--svg", to.svg, "draw the charts in this directory");
     app.add_option("--memory-of", memory_of)->group("");
     CLI11_PARSE(app, argc, p_argv);
 

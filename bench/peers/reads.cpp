@@ -88,11 +88,13 @@ void run_by_name(arena & a)
 {
     if (a.wants({"name_int", "name_int_tx", "name_text", "name_text_tx"})) {
         a.load(layout::by_name);
+        a.reopen(layout::by_name);
         measure_reads(a, "name_int", a.data().names(), field::count);
         measure_reads(a, "name_text", a.data().names(), field::note);
     }
     if (a.wants({"index_int", "index_int_tx", "index_text", "index_text_tx"})) {
         a.load(layout::by_id_and_name);
+        a.reopen(layout::by_id_and_name);
         measure_reads(a, "index_int", a.data().names(), field::count);
         measure_reads(a, "index_text", a.data().names(), field::note);
     }

@@ -5,6 +5,7 @@
 
 #include <fmt/os.h>
 
+#include "cells.h"
 #include "store.h"
 #include "workloads.h"
 
@@ -14,49 +15,12 @@ namespace peers
 namespace
 {
 
-// "1,000,000"
-std::string with_separators(std::size_t number)
-{
-    return number < 1000 ? fmt::format("{}", number)
-                         : fmt::format("{},{:03}", with_separators(number / 1000), number % 1000);
-}
-
-// How many times as much as this library; for figures of which more is better, how many times less.
-std::optional<double> ratio_of(const results & figures, std::size_t rows, const workload & w, std::string_view store)
-{
-    const auto ours   = figures.of(rows, w.name, store_kinds()[0].name);
-    const auto theirs = figures.of(rows, w.name, store);
-    if (!ours || !theirs || ours->median == 0 || theirs->median == 0 || store == store_kinds()[0].name)
-        return std::nullopt;
-    return w.in == unit::times ? ours->median / theirs->median : theirs->median / ours->median;
-}
-
-std::string cell_of(const results & figures, std::size_t rows, const workload & w, std::string_view store)
-{
-    const auto figure = figures.of(rows, w.name, store);
-    if (!figure)
-        return "–";
-    const auto ratio = ratio_of(figures, rows, w, store);
-    return ratio ? fmt::format("{} ({:.{}f})", text_of(figure->median, w.in), *ratio, *ratio < 10 ? 2 : 0)
-                 : text_of(figure->median, w.in);
-}
-
 template <class Out> void write_machine(const results & figures, Out out)
 {
     for (const workload & limit : machine_limits())
         for (const std::size_t rows : figures.sizes())
             if (const auto figure = figures.of(rows, limit.name, machine))
                 out(limit, rows, *figure);
-}
-
-// What a transaction of one row costs in fsync pairs.
-std::optional<double> pairs_of(const results & figures, std::size_t rows, const workload & w, std::string_view store)
-{
-    const auto figure = figures.of(rows, w.name, store);
-    const auto pair   = figures.of(rows, "fsync_pair", machine);
-    if (!figure || !pair || !std::string_view(w.name).starts_with("durable_"))
-        return std::nullopt;
-    return figure->median / pair->median;
 }
 
 } // namespace

@@ -25,6 +25,12 @@ void results::add(std::size_t rows, std::string_view workload, std::string_view 
     samples_[{rows, std::string(workload), std::string(store)}].push_back(value);
 }
 
+void results::note(const std::string & text)
+{
+    if (std::find(notes_.begin(), notes_.end(), text) == notes_.end())
+        notes_.push_back(text);
+}
+
 std::optional<summary> results::of(std::size_t rows, std::string_view workload, std::string_view store) const
 {
     const auto found = samples_.find({rows, std::string(workload), std::string(store)});

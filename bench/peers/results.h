@@ -29,7 +29,7 @@ class results
   public:
     void add(std::size_t rows, std::string_view workload, std::string_view store, double value);
     // Why a figure is missing.
-    void note(std::string text) { notes_.push_back(std::move(text)); }
+    void note(const std::string & text);
 
     [[nodiscard]] std::optional<summary> of(std::size_t rows, std::string_view workload, std::string_view store) const;
     [[nodiscard]] std::vector<std::size_t> sizes() const;

@@ -13,6 +13,7 @@ constexpr workload all[] = {
     {"durable_insert", unit::nanoseconds, "transaction", "one row inserted in a durable transaction of its own"},
     {"durable_update", unit::nanoseconds, "transaction",
      "one field of one row set in a durable transaction of its own"},
+    {"durable_reopened", unit::nanoseconds, "transaction", "durable_update after the store was closed and opened"},
     {"batch_insert", unit::nanoseconds, "row", "all rows inserted in one transaction"},
     {"batch_update", unit::nanoseconds, "row",
      "one field of every row set by key, in random order, in one transaction"},
@@ -75,10 +76,12 @@ std::span<const workload> machine_limits()
     return limits;
 }
 
-std::string text_of(double value, unit in)
+std::string text_of(double value, unit in, digits shown)
 {
-    const auto scaled = [value](double by, const char * p_unit) {
+    const auto scaled = [value, shown](double by, const char * p_unit) {
         const double v = value / by;
+        if (shown == digits::needed)
+            return fmt::format("{:g} {}", v, p_unit);
         return fmt::format("{:.{}f} {}", v, v < 10 ? 2 : v < 100 ? 1 : 0, p_unit);
     };
     switch (in) {
@@ -87,7 +90,7 @@ std::string text_of(double value, unit in)
     case unit::bytes:
         return fmt::format("{:.0f} B", value);
     case unit::times:
-        return fmt::format("{:.2f}", value);
+        return shown == digits::needed ? fmt::format("{:g}", value) : fmt::format("{:.2f}", value);
     case unit::gigabytes_a_second:
         break;
     }

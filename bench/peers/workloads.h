@@ -24,8 +24,9 @@ std::span<const workload> workloads();
 // What the machine itself can do; measured in the same run.
 std::span<const workload> machine_limits();
 
-// A figure as a person reads it: "412 ns", "1.8 ms", "93 B".
-std::string text_of(double value, unit in);
+// A figure as a person reads it: "412 ns", "1.80 ms", "93 B".
+enum class digits { three, needed };
+std::string text_of(double value, unit in, digits shown = digits::three);
 
 } // namespace peers
 
