@@ -33,8 +33,11 @@ struct options {
     std::vector<std::string> workloads; // empty: all
     int                      repeat       = 5;
     double                   slice        = 0.03; // seconds that a repetition of a short call goes on
-    double                   patience     = 60;   // a store that would need more seconds to be loaded is left out
+    double                   patience     = 30;   // a store that would need more seconds for something long is left out
     int                      transactions = 40;   // durable ones in a repetition
+    // Ten rounds of updates are for so many rows or fewer: bytes a row are the same from some size on, and millions of
+    // updates take a while.
+    std::size_t most_updated = 100'000;
 };
 
 enum class clock_kind { wall, processor };
@@ -88,6 +91,10 @@ class arena
     // Whether a store can be expected to do something in time, from how long it took with fewer rows; notes it if not.
     bool expects_in_time(const contestant & c, const std::string & what);
     void took(const contestant & c, const std::string & what, double seconds);
+
+    // Repeats an action that takes long. A store that has worked for some time at it begins no other repetition, and one
+    // that can't be expected to do it in time doesn't begin at all.
+    void repeat_long(const std::string & what, const std::function<void(contestant &)> & action);
 
     // Calls action for each of the stores, or each that was loaded, in the order of repetition n.
     void each(int repetition, const std::function<void(contestant &)> & action);

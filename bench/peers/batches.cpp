@@ -13,9 +13,6 @@ namespace
 
 constexpr std::size_t keys_deleted = 100;
 
-// A store that has worked so many seconds begins no other repetition: large batches vary less from time to time.
-constexpr double longest_batches = 12;
-
 void require_rows(contestant & c, filter wanted, std::size_t rows)
 {
     const std::size_t counted = c.p_store->count(wanted);
@@ -67,16 +64,8 @@ void run_batches(arena & a)
 {
     if (!a.wants({"batch_insert", "batch_update", "delete_keys", "delete_half", "delete_all"}))
         return;
-    const std::vector<change>            changes = a.data().changes(1);
-    std::map<const contestant *, double> seconds;
-    for (int repetition = 0; repetition < a.chosen().repeat; ++repetition)
-        a.each(repetition, [&](contestant & c) {
-            if (seconds[&c] > longest_batches || !a.expects_in_time(c, "a cycle of batches"))
-                return;
-            const double cycle = seconds_of(clock_kind::wall, [&] { run_cycle(a, c, changes); });
-            a.took(c, "a cycle of batches", cycle);
-            seconds[&c] += cycle;
-        });
+    const std::vector<change> changes = a.data().changes(1);
+    a.repeat_long("a cycle of batches", [&](contestant & c) { run_cycle(a, c, changes); });
     a.clear();
 }
 

@@ -85,7 +85,7 @@ hashing hashing_for(bool names, std::size_t rows)
 
 // ---- The tables ----
 
-char Id[]{"id"}, Count[]{"count"}, Ratio[]{"ratio"}, Name[]{"name"}, Note[]{"note"};
+char Id[]{"id"}, Count[]{"count"}, Ratio[]{"ratio"}, Name[]{"name"}, Note[]{"note"}, Added[]{"added"};
 char Mount_Point[]{"/m"}, Rows_Path[]{"/m/rows"}, Names_Path[]{"/m/names"};
 
 kt_value_t value_of(std::uint64_t id)
@@ -202,6 +202,32 @@ class kt_rg_store final : public store
     {
         check(rg_delete_rows_1(rows_, nullptr), "delete");
         commit(rows_);
+    }
+
+    // Updates must not follow before the table has been closed and opened; reads and other column changes may.
+    void add_column() override
+    {
+        rg_column_t added             = column(Added, KT_INT64, false);
+        added.default_value.val_int64 = added_default;
+        check(rg_add_columns_1(rows_, &added, 1), "add column");
+    }
+
+    void drop_column() override
+    {
+        kt_char_ptr_t names[]{Added};
+        check(rg_delete_columns_1(rows_, names, 1), "delete column");
+    }
+
+    std::uint64_t sum_added() override
+    {
+        std::uint64_t     sum   = 0;
+        const kt_uint32_t total = rows_of(rows_);
+        for (kt_uint32_t i = 0; i < total; ++i) {
+            kt_value_t value;
+            check(rg_get_field_by_index_1(rows_, static_cast<kt_int32_t>(i), Added, &value), "get added");
+            sum += digest(value.val_int64);
+        }
+        return sum;
     }
 
     std::uint64_t read(std::span<const std::uint64_t> ids, field wanted, scope) override

@@ -132,6 +132,23 @@ class leveldb_store final : public store
 
     void erase_all() override { erase(filter::everything); }
 
+    void add_column() override
+    {
+        rewrite([](packed_row & r) { r.append(added_default); });
+    }
+
+    void drop_column() override
+    {
+        rewrite([](packed_row & r) { r.cut(); });
+    }
+
+    std::uint64_t sum_added() override
+    {
+        std::uint64_t sum = 0;
+        scan([&](std::string_view, const stored_row & r) { sum += digest(r.added()); });
+        return sum;
+    }
+
     std::uint64_t read(std::span<const std::uint64_t> ids, field wanted, scope transactions) override
     {
         return read_keys(ids, transactions, [&](const leveldb::ReadOptions & how, std::uint64_t id) {
@@ -183,6 +200,18 @@ class leveldb_store final : public store
     std::uint64_t drop_copy() override { return copy_.drop(); }
 
   private:
+    // Changes every row.
+    template <class Change> void rewrite(Change change_row)
+    {
+        leveldb::WriteBatch batch;
+        scan([&](std::string_view key, const stored_row & r) {
+            packed_row packed(r.bytes());
+            change_row(packed);
+            batch.Put(slice_of(key), slice_of(packed.view()));
+        });
+        write(batch);
+    }
+
     void write(leveldb::WriteBatch & batch)
     {
         leveldb::WriteOptions durable;

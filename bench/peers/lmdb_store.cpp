@@ -45,6 +45,13 @@ std::string_view view_of(const MDB_val & value)
     return {static_cast<const char *>(value.mv_data), value.mv_size};
 }
 
+std::uint64_t id_of(const MDB_val & key)
+{
+    std::uint64_t id;
+    std::memcpy(&id, key.mv_data, sizeof id);
+    return id;
+}
+
 // A writing transaction, aborted unless it was committed.
 class transaction
 {
@@ -183,6 +190,23 @@ class lmdb_store final : public store
         t.commit();
     }
 
+    void add_column() override
+    {
+        rewrite([](packed_row & r) { r.append(added_default); });
+    }
+
+    void drop_column() override
+    {
+        rewrite([](packed_row & r) { r.cut(); });
+    }
+
+    std::uint64_t sum_added() override
+    {
+        std::uint64_t sum = 0;
+        scan([&](std::uint64_t, const stored_row & r) { sum += digest(r.added()); });
+        return sum;
+    }
+
     std::uint64_t read(std::span<const std::uint64_t> ids, field wanted, scope transactions) override
     {
         return read_keys(ids, transactions, [&](std::uint64_t id) { return get(key_of(id)).digest_of(wanted); });
@@ -233,6 +257,26 @@ class lmdb_store final : public store
     std::uint64_t drop_copy() override { return copy_.drop(); }
 
   private:
+    // Changes every row.
+    template <class Change> void rewrite(Change change_row)
+    {
+        transaction t(e_.p_env);
+        {
+            const cursor at(t, e_.rows);
+            MDB_val      key;
+            MDB_val      value;
+            while (mdb_cursor_get(at, &key, &value, MDB_NEXT) == MDB_SUCCESS) {
+                const std::uint64_t id = id_of(key); // a copy: what the cursor delivers lies in the page that changes
+                packed_row          packed(view_of(value));
+                change_row(packed);
+                key   = key_of(id);
+                value = value_of(packed.view().data(), packed.view().size());
+                check(mdb_cursor_put(at, &key, &value, MDB_CURRENT), "rewrite");
+            }
+        }
+        t.commit();
+    }
+
     void insert_names(MDB_txn * p_txn, std::span<const row> rows)
     {
         for (const row & r : rows) {
@@ -279,9 +323,7 @@ class lmdb_store final : public store
             MDB_val      key;
             MDB_val      value;
             while (mdb_cursor_get(at, &key, &value, MDB_NEXT) == MDB_SUCCESS) {
-                std::uint64_t id;
-                std::memcpy(&id, key.mv_data, sizeof id);
-                visit(id, stored_row(view_of(value)));
+                visit(id_of(key), stored_row(view_of(value)));
             }
         });
     }

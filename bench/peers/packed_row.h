@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: MIT
 // packed_row: a row as the value of a key-value store, laid out as its user would: fixed fields first, at known places,
-// so that a field is read without unpacking anything. Host byte order.
+// so that a field is read without unpacking anything. Host byte order. A column is added by appending a field to every
+// row.
 #ifndef PEERS_PACKED_ROW_H
 #define PEERS_PACKED_ROW_H
 
@@ -36,6 +37,14 @@ class packed_row
         std::memcpy(bytes_, stored.data(), stored.size());
     }
 
+    // A further field, behind all others.
+    void append(std::int64_t added)
+    {
+        std::memcpy(bytes_ + length_, &added, sizeof added);
+        length_ += sizeof added;
+    }
+    void cut() { length_ -= sizeof(std::int64_t); }
+
     void set_count(std::int64_t count) { std::memcpy(bytes_, &count, sizeof count); }
 
     [[nodiscard]] char *           data() { return bytes_; }
@@ -44,7 +53,7 @@ class packed_row
     static constexpr std::size_t second_key = 17;
 
   private:
-    char        bytes_[second_key + name_length + note_length];
+    char        bytes_[second_key + name_length + note_length + sizeof(std::int64_t)];
     std::size_t length_;
 };
 
@@ -55,10 +64,16 @@ class stored_row
     explicit stored_row(std::string_view bytes) : bytes_(bytes) {}
     stored_row(const void * p_bytes, std::size_t length) : bytes_(static_cast<const char *>(p_bytes), length) {}
 
+    [[nodiscard]] std::string_view bytes() const { return bytes_; }
     [[nodiscard]] std::int64_t     count() const { return load<std::int64_t>(0); }
     [[nodiscard]] double           ratio() const { return load<double>(8); }
     [[nodiscard]] std::string_view name() const { return bytes_.substr(packed_row::second_key, second_length()); }
-    [[nodiscard]] std::string_view note() const { return bytes_.substr(packed_row::second_key + second_length()); }
+    [[nodiscard]] std::string_view note() const
+    {
+        return bytes_.substr(packed_row::second_key + second_length(), note_length);
+    }
+    // The field behind all others, if one was appended.
+    [[nodiscard]] std::int64_t added() const { return load<std::int64_t>(bytes_.size() - sizeof(std::int64_t)); }
 
     // The digest of one field, of a copy if it is a text.
     [[nodiscard]] std::uint64_t digest_of(field wanted) const

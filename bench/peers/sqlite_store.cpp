@@ -116,6 +116,21 @@ class sqlite_store final : public store
 
     void erase_all() override { run("delete from t"); }
 
+    // Only the schema changes: rows that lack a column have its default.
+    void add_column() override { run(fmt::format("alter table t add column added integer default {}", added_default)); }
+
+    void drop_column() override { run("alter table t drop column added"); }
+
+    std::uint64_t sum_added() override
+    {
+        sqlite3_stmt * p = nullptr; // not kept: it would have to be prepared anew without the column
+        check(sqlite3_prepare_v2(p_db_, "select sum(added) from t", -1, &p, nullptr), "sum");
+        sqlite3_step(p);
+        const auto sum = static_cast<std::uint64_t>(sqlite3_column_int64(p, 0));
+        check(sqlite3_finalize(p), "sum");
+        return sum;
+    }
+
     std::uint64_t read(std::span<const std::uint64_t> ids, field wanted, scope transactions) override
     {
         sqlite3_stmt * p = prepared(fmt::format("select {} from t where id = ?", column_of(wanted)));

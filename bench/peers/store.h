@@ -27,6 +27,9 @@ enum class scope { alone, together };
 
 enum class access { create, write, read };
 
+// The value of the column that is added.
+constexpr std::int64_t added_default = 7;
+
 struct place {
     std::string directory;
     layout      found_by;
@@ -55,6 +58,13 @@ class store
     virtual void erase(std::span<const std::uint64_t> ids) = 0;
     virtual void erase(filter wanted)                      = 0;
     virtual void erase_all()                               = 0;
+
+    // ---- Columns: an integer one is added to the others, with a default value, and dropped; one transaction each ----
+
+    virtual void add_column()  = 0;
+    virtual void drop_column() = 0;
+    // The sum of that column over all rows.
+    virtual std::uint64_t sum_added() = 0;
 
     // ---- Reading; each delivers the sum of what it read ----
 

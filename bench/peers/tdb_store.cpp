@@ -107,7 +107,7 @@ class tdb_store final : public store
         });
     }
 
-    // A record that is deleted during a traversal is only marked, and so costs more than one deleted afterwards.
+    // Not during the traversal: a record that is deleted then is only marked, and costs more than one deleted afterwards.
     void erase(filter wanted) override
     {
         std::vector<std::uint64_t> ids;
@@ -123,6 +123,23 @@ class tdb_store final : public store
     void erase_all() override
     {
         in_transaction([&] { check(tdb_wipe_all(p_tdb_), "wipe"); });
+    }
+
+    void add_column() override
+    {
+        rewrite([](packed_row & r) { r.append(added_default); });
+    }
+
+    void drop_column() override
+    {
+        rewrite([](packed_row & r) { r.cut(); });
+    }
+
+    std::uint64_t sum_added() override
+    {
+        std::uint64_t sum = 0;
+        scan([&](std::uint64_t, const stored_row & r) { sum += digest(r.added()); });
+        return sum;
     }
 
     std::uint64_t read(std::span<const std::uint64_t> ids, field wanted, scope transactions) override
@@ -172,6 +189,20 @@ class tdb_store final : public store
     std::uint64_t drop_copy() override { return copy_.drop(); }
 
   private:
+    // Changes every row; not during the traversal, for the reason above.
+    template <class Change> void rewrite(Change change_row)
+    {
+        std::vector<std::pair<std::uint64_t, packed_row>> rows;
+        scan([&](std::uint64_t id, const stored_row & r) {
+            rows.emplace_back(id, packed_row(r.bytes()));
+            change_row(rows.back().second);
+        });
+        in_transaction([&] {
+            for (const auto & [id, packed] : rows)
+                put(key_of(id), packed.view(), TDB_MODIFY);
+        });
+    }
+
     void check(int code, const char * p_what)
     {
         if (code < 0)

@@ -45,6 +45,8 @@ constexpr workload all[] = {
      "count > 499 and name like 'ab%' and ratio < 0.99 counted: a quarter of the rows"},
     {"scan_copy_1", unit::nanoseconds, "row scanned", "a hundredth of the rows found and copied into memory"},
     {"scan_copy_50", unit::nanoseconds, "row scanned", "half of the rows found and copied into memory"},
+    {"add_column", unit::nanoseconds, "row", "an integer column with a default value added to a full table"},
+    {"drop_column", unit::nanoseconds, "row", "that column dropped"},
     {"open_one", unit::nanoseconds, "open", "the store opened and the count of one row read by key"},
     {"open_all", unit::nanoseconds, "row", "the store opened and all fields of all rows read"},
     {"memory_private", unit::bytes, "row", "private memory once opened and all rows read"},
