@@ -46,6 +46,7 @@ template <class T> [[nodiscard]] bool allocate(owned_ptr<T> & array, kt_uint64_t
 // Changes one of the columns of the table, which are described here in client form.
 [[nodiscard]] kt_int32_t change_column(const change_t & change, rg_column_t * p_columns, kt_uint32_t described_columns)
 {
+    // Kept because callers depend on it: without a name the table is rebuilt as it is.
     if (change.p_old_column_name == nullptr)
         return 0;
     // Where a column is hidden, the description lacks it, and a table made of the rest would lose it.

@@ -16,6 +16,7 @@ extern "C" kt_int32_t rg_add_columns_1(rg_opaque_handle_t table_handle, rg_colum
     const rg_i_site_t site = RG_HERE;
     return rg_i_column_change_call<entry_id::add_columns>(
         site, table_handle, [&](rg_i_table_t & table, rg_i_table_t ** p_p_new_table) {
+            // Kept because callers depend on it: no columns at all make a plain rebuild.
             if (columns == nullptr && array_count != 0)
                 return rg_i_fail(site, RG_E_NULL_POINTER);
             return rg_i_update_metadata(&table, columns, array_count, nullptr, nullptr, nullptr, p_p_new_table);
