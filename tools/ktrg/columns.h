@@ -60,6 +60,11 @@ struct column {
 {
     return type >= KT_CHAR_PTR && type <= KT_SD_PTR_ARRAY;
 }
+// Whether the number is a type at all.
+[[nodiscard]] constexpr bool is_value_type(kt_data_type_t type)
+{
+    return type >= KT_INT32 && type <= KT_SD_PTR_ARRAY;
+}
 [[nodiscard]] constexpr bool can_be_key(kt_data_type_t type)
 {
     return is_number(type) || type == KT_CHAR_PTR || type == KT_RSRC_HANDLE_PTR;

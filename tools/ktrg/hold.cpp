@@ -72,13 +72,16 @@ void wait_while_held(const place & where, double wait_seconds)
     });
 }
 
+void wait_for_directory(const place & where, double wait_seconds)
+{
+    wait_until_free(where, wait_seconds,
+                    [&where] { return holder_of(where.directory + "/,Lock", where.name) == holding::somebody; });
+}
+
 void wait_for_target(const place & where, double wait_seconds)
 {
-    const std::string lock_file = where.directory + "/,Lock";
-    wait_until_free(where, wait_seconds, [&] {
-        return holder_of(lock_file, where.name) == holding::somebody ||
-               holder_of(where.file, where.name) == holding::somebody;
-    });
+    wait_for_directory(where, wait_seconds);
+    wait_until_free(where, wait_seconds, [&where] { return holder_of(where.file, where.name) == holding::somebody; });
 }
 
 file_hold::file_hold(const std::string & file, const std::string & subject)

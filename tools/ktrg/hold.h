@@ -19,6 +19,10 @@ void wait_while_held(const place & where, double wait_seconds);
 // copies into its directory.
 void wait_for_target(const place & where, double wait_seconds);
 
+// Waits until no other process copies or moves tables into the place's directory. For one who holds the table itself, whose
+// lock would go if its file were opened here.
+void wait_for_directory(const place & where, double wait_seconds);
+
 // Holds the lock of a file's writer, if the file is there, until it goes. Throws the failure of exit code 5 if another
 // process has it.
 class file_hold

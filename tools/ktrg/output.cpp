@@ -45,43 +45,31 @@ void append_csv(std::string & result, const cell & from, const output_style & st
     result += '"';
 }
 
-class csv_writer : public row_writer
-{
-  public:
-    csv_writer(const output_style & style, output_sink & sink) : style_(style), sink_(sink) {}
-    void begin(const std::vector<output_column> & columns) override
-    {
-        if (!style_.header)
-            return;
-        std::vector<cell> names;
-        for (const output_column & each : columns)
-            names.push_back(cell::of_text(each.name));
-        row(names);
-    }
-    void row(const std::vector<cell> & cells) override
-    {
-        line_.clear();
-        for (const cell & each : cells) {
-            if (&each != &cells.front())
-                line_ += ',';
-            append_csv(line_, each, style_);
-        }
-        line_ += "\r\n";
-        sink_.write(line_);
-    }
-    void end() override {}
-
-  private:
-    output_style  style_;
-    output_sink & sink_;
-    std::string   line_;
-};
-
 // One line a row: tabs, line ends and backslashes in a cell appear as \t, \n, \r and \\.
-class tsv_writer : public row_writer
+void append_tsv(std::string & result, const cell & from, const output_style & style)
+{
+    for (const char c : escaped_bytes(plain_text(from, style))) {
+        if (c == '\t')
+            result += "\\t";
+        else if (c == '\n')
+            result += "\\n";
+        else if (c == '\r')
+            result += "\\r";
+        else if (c == '\\')
+            result += "\\\\";
+        else
+            result += c;
+    }
+}
+
+// Cells with a character between them: csv and tsv.
+class separated_writer : public row_writer
 {
   public:
-    tsv_writer(const output_style & style, output_sink & sink) : style_(style), sink_(sink) {}
+    separated_writer(const output_style & style, output_sink & sink, bool tabs)
+        : style_(style), sink_(sink), tabs_(tabs)
+    {
+    }
     void begin(const std::vector<output_column> & columns) override
     {
         if (!style_.header)
@@ -96,33 +84,21 @@ class tsv_writer : public row_writer
         line_.clear();
         for (const cell & each : cells) {
             if (&each != &cells.front())
-                line_ += '\t';
-            append(plain_text(each, style_));
+                line_ += tabs_ ? '\t' : ',';
+            if (tabs_)
+                append_tsv(line_, each, style_);
+            else
+                append_csv(line_, each, style_);
         }
-        line_ += '\n';
+        line_ += tabs_ ? "\n" : "\r\n";
         sink_.write(line_);
     }
     void end() override {}
 
   private:
-    void append(const std::string & text)
-    {
-        for (const char c : escaped_bytes(text)) {
-            if (c == '\t')
-                line_ += "\\t";
-            else if (c == '\n')
-                line_ += "\\n";
-            else if (c == '\r')
-                line_ += "\\r";
-            else if (c == '\\')
-                line_ += "\\\\";
-            else
-                line_ += c;
-        }
-    }
-
     output_style  style_;
     output_sink & sink_;
+    bool          tabs_;
     std::string   line_;
 };
 
@@ -276,11 +252,11 @@ void output_sink::flush()
 {
     std::string_view rest = buffer_;
     while (!rest.empty()) {
-        const ssize_t written = ::write(STDOUT_FILENO, rest.data(), rest.size());
+        const ssize_t written = ::write(fd_, rest.data(), rest.size());
         if (written < 0 && errno == EINTR)
             continue;
         if (written < 0)
-            throw failure(exit_code::input_output, "standard output", std::strerror(errno));
+            throw failure(exit_code::input_output, name_, std::strerror(errno));
         rest.remove_prefix(static_cast<std::size_t>(written));
     }
     buffer_.clear();
@@ -294,9 +270,9 @@ std::unique_ptr<row_writer> make_row_writer(const output_style & style, output_s
     case output_form::line:
         return std::make_unique<line_writer>(style, sink);
     case output_form::csv:
-        return std::make_unique<csv_writer>(style, sink);
+        return std::make_unique<separated_writer>(style, sink, false);
     case output_form::tsv:
-        return std::make_unique<tsv_writer>(style, sink);
+        return std::make_unique<separated_writer>(style, sink, true);
     case output_form::json:
         return std::make_unique<json_writer>(style, sink, false);
     case output_form::jsonl:

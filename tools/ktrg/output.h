@@ -30,14 +30,18 @@ struct output_column {
     bool        right_aligned = false;
 };
 
-// Standard output, with each failure to write noticed.
+// Standard output, or a file that is open for writing, with each failure to write noticed.
 class output_sink
 {
   public:
+    output_sink() : output_sink(1, "standard output") {}
+    output_sink(int fd, std::string name) : fd_(fd), name_(std::move(name)) {}
     void write(std::string_view text);
     void flush();
 
   private:
+    int         fd_;
+    std::string name_; // for messages
     std::string buffer_;
 };
 

@@ -15,11 +15,12 @@ inline constexpr const char * mount_point        = "/t";
 inline constexpr const char * target_mount_point = "/u";
 
 struct place {
-    std::string                  name;          // as the user wrote it, without @COUNTER: for messages
-    std::string                  directory;     // "." if the name has no "/" and KTRG_ROOT isn't set
-    std::string                  file_name;     // in that directory
-    std::string                  file;          // path of the table's file
-    std::string                  registry_path; // below mount_point, with "/" for each "," of the file's name
+    std::string                  name;      // as the user wrote it, without @COUNTER: for messages
+    std::string                  directory; // "." if the name has no "/" and KTRG_ROOT isn't set
+    std::string                  file_name; // in that directory
+    std::string                  file;      // path of the table's file
+    std::string                  mounted_at = mount_point;
+    std::string                  registry_path; // below it, with "/" for each "," of the file's name
     std::optional<std::uint64_t> counter;       // of TABLE@COUNTER
 };
 

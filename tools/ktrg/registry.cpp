@@ -13,9 +13,9 @@
 #include <fmt/format.h>
 #include <sys/stat.h>
 
+#include "column_definitions.h"
 #include "failure.h"
 #include "hold.h"
-#include "key_hash.h"
 #include "selection.h"
 #include "table_file.h"
 #include "talk.h"
@@ -75,50 +75,6 @@ file_identity identity_of(const std::string & file)
     return stat(file.c_str(), &status) == 0 ? file_identity{status.st_dev, status.st_ino} : file_identity{};
 }
 
-// The columns as the library takes them. Defaults and names live as long as this does.
-struct column_definitions {
-    explicit column_definitions(const std::vector<column> & columns, const place & where)
-    {
-        for (const column & each : columns) {
-            rg_column_t definition{};
-            definition.name       = writable(each.name);
-            definition.type       = each.type;
-            definition.qualifier  = each.qualifier;
-            definition.properties = each.properties;
-            if (!each.fields.empty())
-                definition.sd_defn = make_fields(each);
-            if (!each.default_text.empty())
-                definition.default_value = default_of(each, where);
-            definitions.push_back(definition);
-        }
-    }
-
-    std::vector<rg_column_t> definitions;
-
-  private:
-    rg_sd_def_t * make_fields(const column & of)
-    {
-        auto * p_definition = static_cast<rg_sd_def_t *>(
-            arena_.allocate(offsetof(rg_sd_def_t, fields) + of.fields.size() * sizeof(rg_field_def_t)));
-        p_definition->number_of_fields = static_cast<kt_uint32_t>(of.fields.size());
-        for (std::size_t i = 0; i < of.fields.size(); i++)
-            p_definition->fields[i] = {of.fields[i].type, writable(of.fields[i].name)};
-        return p_definition;
-    }
-
-    kt_value_t default_of(const column & of, const place & where)
-    {
-        try {
-            return parse_value(of.type, of.fields, of.default_text, arena_);
-        } catch (const failure & what) {
-            throw failure(exit_code::usage, where.name, fmt::format("the default of \"{}\": {}", of.name, what.text()),
-                          RG_E_INVALID_COLUMN);
-        }
-    }
-
-    value_arena arena_;
-};
-
 } // namespace
 
 // ---- Rows ----
@@ -172,7 +128,7 @@ void table::open(kt_int32_t mode, bool hashed)
 {
     columns_ = read_table_columns(where_.file, where_.name);
     tree_    = tree(where_);
-    tree_.mount(where_);
+    tree_.mount(where_, where_.mounted_at);
     const key_hash hash = key_hash_for(columns_.front().type, rows_for(where_.file, columns_.size()));
     kt_int32_t     code = RG_E_DUPLICATE_KEY;
     if (hashed && hash.buckets != 0)
@@ -228,17 +184,16 @@ table table::open_for_writing(const place & where, double wait_seconds)
 void table::make(const std::string & registry_path, const std::vector<column> & columns, std::uint64_t expected_rows)
 {
     columns_ = columns;
-    column_definitions definitions(columns_, where_);
+    column_definitions definitions(columns_, where_.name);
     const auto         count = static_cast<kt_uint32_t>(columns_.size());
     const kt_int32_t   mode  = RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL;
     const key_hash     hash  = columns_.empty() ? key_hash{} : key_hash_for(columns_.front().type, expected_rows);
     kt_int32_t         code  = 0;
     if (hash.buckets != 0)
-        code = rg_create_hashed_key_table_1(tree_.handle(), writable(registry_path), definitions.definitions.data(),
-                                            count, mode, hash.buckets, hash.p_hash, hash.p_compare, &handle_);
+        code = rg_create_hashed_key_table_1(tree_.handle(), writable(registry_path), definitions.data(), count, mode,
+                                            hash.buckets, hash.p_hash, hash.p_compare, &handle_);
     else
-        code = rg_create_table_1(tree_.handle(), writable(registry_path), definitions.definitions.data(), count, mode,
-                                 &handle_);
+        code = rg_create_table_1(tree_.handle(), writable(registry_path), definitions.data(), count, mode, &handle_);
     if (code == RG_E_DUPLICATE_KEY)
         throw failure(exit_code::usage, where_.name, "two columns are marked as the key", code);
     if (code == RG_E_KEY_EXPECTED)
@@ -254,7 +209,7 @@ table table::create(const place & where, const std::vector<column> & columns, st
     if (stat(where.file.c_str(), &status) == 0)
         throw registry_failure(RG_E_TABLE_EXISTS, where.name);
     result.tree_ = tree(where);
-    result.tree_.mount(where);
+    result.tree_.mount(where, where.mounted_at);
     result.make(where.registry_path, columns, expected_rows);
     return result;
 }
@@ -264,6 +219,21 @@ table table::create_in_memory(const place & where, const std::vector<column> & c
     table result(where);
     result.tree_ = tree(where);
     result.make("memory", columns, expected_rows);
+    return result;
+}
+
+table table::from_packed(const place & where, void * p_buffer, kt_uint32_t index, const key_hash & hash)
+{
+    table result(where);
+    result.tree_          = tree(where);
+    const kt_int32_t code = rg_unpack_table_1(p_buffer, hash.buckets, hash.p_hash, hash.p_compare,
+                                              result.tree_.handle(), index, &result.handle_);
+    if (code == RG_E_NO_MEMORY)
+        check(code, where);
+    if (code != 0)
+        throw failure(exit_code::damaged, where.name,
+                      fmt::format("the packed file is damaged: {}", registry_failure(code, "").text()), code);
+    result.take_metadata();
     return result;
 }
 
@@ -398,6 +368,28 @@ void table::delete_all() const
     check(rg_delete_rows_1(handle_, nullptr), where_);
 }
 
+std::optional<std::vector<unsigned char>> table::blob() const
+{
+    kt_binary_t *    p_blob = nullptr;
+    const kt_int32_t code   = rg_get_application_metadata_1(handle_, &p_blob);
+    if (code == RG_E_NO_SUCH_KEY)
+        return std::nullopt;
+    check(code, where_);
+    std::vector<unsigned char> result(p_blob->data, p_blob->data + p_blob->length);
+    std::free(p_blob);
+    return result;
+}
+
+void table::set_blob(const std::vector<unsigned char> & blob) const
+{
+    std::vector<kt_uint32_t> block(1 + (offsetof(kt_binary_t, data) + blob.size()) / sizeof(kt_uint32_t) + 1);
+    auto *                   p_blob = reinterpret_cast<kt_binary_t *>(block.data());
+    p_blob->length                  = static_cast<kt_uint32_t>(blob.size());
+    if (!blob.empty())
+        std::memcpy(p_blob->data, blob.data(), blob.size());
+    check(rg_set_application_metadata_1(handle_, p_blob), where_);
+}
+
 void table::finish(bool dry_run)
 {
     if (!dry_run)
@@ -405,10 +397,10 @@ void table::finish(bool dry_run)
     close();
 }
 
-void table::commit()
+void table::commit(std::uint64_t counter)
 {
     const stopwatch time;
-    check(rg_apply_1(handle_, 0), where_);
+    check(rg_apply_1(handle_, counter), where_);
     check(rg_commit_1(handle_), where_);
     if (!verbose())
         return;

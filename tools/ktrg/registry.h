@@ -7,10 +7,12 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
 #include "columns.h"
+#include "key_hash.h"
 #include "kt_rg.h"
 #include "talk.h"
 #include "tree.h"
@@ -52,6 +54,10 @@ class table
     static table create_in_memory(const place & where, const std::vector<column> & columns,
                                   std::uint64_t expected_rows);
 
+    // A table of a packed buffer, in memory and for reading, under the place's registry path. What the library refuses is
+    // a failure of exit code 4.
+    static table from_packed(const place & where, void * p_buffer, kt_uint32_t index, const key_hash & hash);
+
     table(table && other) noexcept;
     table & operator=(table &&) = delete;
     ~table();
@@ -89,8 +95,13 @@ class table
     // Deletes them all.
     void delete_all() const;
 
-    // Makes all that is pending permanent, in one transaction.
-    void commit();
+    // The application's blob, as committed; none if there is none.
+    [[nodiscard]] std::optional<std::vector<unsigned char>> blob() const;
+    void                                                    set_blob(const std::vector<unsigned char> & blob) const;
+
+    // Makes all that is pending permanent, in one transaction. The change counter becomes `counter`, or one more than it
+    // was for 0.
+    void commit(std::uint64_t counter = 0);
     // Commits and closes; a dry run drops what is pending instead.
     void finish(bool dry_run);
     // Gives the table back. What isn't committed is gone.

@@ -37,10 +37,13 @@ struct settings {
     create_options create;
     put_options    put;
     rm_options     rm;
+    alter_options  alter;
     copy_options   cp;
     copy_options   mv;
     tables_options drop;
     tables_options repair;
+    pack_options   pack;
+    unpack_options unpack;
 
     std::function<exit_code()> verb; // what was asked for
 };

@@ -146,6 +146,30 @@ void add_create(CLI::App & app, settings & set)
         ->required();
 }
 
+void add_alter(CLI::App & app, settings & set)
+{
+    alter_options & options = set.alter;
+    CLI::App *      p_verb  = add_verb(
+              app, set, "alter", "Shape", "Change the columns of a table, in one transaction", run_alter, options,
+              {"alter state/hosts --add 'site:string=home' --drop cpus --rename load=load1",
+               "alter state/hosts --default load=0.5 --dry-run"},
+              {"All options name the columns as they are now, so that names may be exchanged. Rows that exist take",
+               "the defaults of added columns, and keep their values when a default changes. A dry run shows the new",
+               "schema.", "",
+               "The library changes columns one call at a time. So the changes are made to a copy of the table,",
+               "which then takes its place in one step: readers see the old table or the new one, whatever happens.",
+               "Rows, blob and key stay, and the change counter goes up by one."});
+    add_table(*p_verb, options.table);
+    p_verb->add_option("--add", options.add, "New columns, as name:type[:flags][=default]")
+        ->type_name("COLUMN,...")
+        ->allow_extra_args(false);
+    add_list(*p_verb, "--drop", options.drop, "Columns that go, with their values", "COL,...");
+    add_list(*p_verb, "--rename", options.rename, "Columns that get another name", "FROM=TO,...");
+    p_verb->add_option("--default", options.defaults, "A column's default for rows to come; once for each column")
+        ->type_name("COL=VAL")
+        ->allow_extra_args(false);
+}
+
 void add_copy_arguments(CLI::App & verb, copy_options & options)
 {
     verb.add_option("SOURCE", options.source, "Path of the table")->required();
@@ -183,6 +207,39 @@ void add_drop(CLI::App & app, settings & set)
         ->required();
 }
 
+// ---- Whole ----
+
+void add_pack(CLI::App & app, settings & set)
+{
+    pack_options & options = set.pack;
+    CLI::App *     p_verb =
+        add_verb(app, set, "pack", "Whole", "Put tables into one file that travels between machines", run_pack, options,
+                 {"pack state.packed state/hosts state/disks", "pack - state/hosts | ssh other ktrg unpack - state"},
+                 {"Each table goes as of its last commit. Blobs and defaults of structures don't travel, and the first",
+                  "field of a structure loses the first four letters of its name: ktrg says where that happens. A file",
+                  "that exists needs --force."});
+    p_verb->add_option("FILE", options.file, "The new file; - is standard output")->required();
+    p_verb->add_option("TABLE", options.tables, "Paths of the tables")->required();
+    p_verb
+        ->add_option("--prefix", options.prefix,
+                     "Registry path of the tables' directory for programs that unpack; /t without it")
+        ->type_name("PATH");
+}
+
+void add_unpack(CLI::App & app, settings & set)
+{
+    unpack_options & options = set.unpack;
+    CLI::App *       p_verb =
+        add_verb(app, set, "unpack", "Whole", "Make tables of a packed file, or describe it", run_unpack, options,
+                 {"unpack state.packed restored", "unpack state.packed --info", "unpack state.packed --info -o json"},
+                 {"Files of both byte orders are understood. All tables appear, or none: they are made in a directory",
+                  "of their own beside their places, each value is looked at, and then they are renamed. Tables that",
+                  "exist need --force."});
+    p_verb->add_option("FILE", options.file, "The packed file; - is standard input")->required();
+    p_verb->add_option("DIR", options.directory, "Directory for the tables");
+    p_verb->add_flag("--info", options.info, "Show byte order, tables, columns, rows and bytes instead");
+}
+
 // ---- Care ----
 
 void add_repair(CLI::App & app, settings & set)
@@ -190,7 +247,8 @@ void add_repair(CLI::App & app, settings & set)
     add_verb(app, set, "repair", "Care", "Remove rewrite files that were left behind", run_repair, set.repair,
              {"repair state", "repair state/hosts --dry-run"},
              {"A process that is killed in the middle of a rewrite leaves a file beside the table, NAME.rewrite, which",
-              "nobody reads. The tables themselves need no repair: each stands at its last commit."})
+              "nobody reads; a killed alter or unpack leaves a directory .ktrg-XXXXXX. The tables themselves need no",
+              "repair: each stands at its last commit. What another process holds is left alone."})
         ->add_option("PATH", set.repair.tables, "Tables, or directories for all that is in them")
         ->required();
 }
@@ -208,9 +266,12 @@ void add_verbs(CLI::App & app, settings & set)
     add_put(app, set);
     add_rm(app, set);
     add_create(app, set);
+    add_alter(app, set);
     add_cp(app, set);
     add_mv(app, set);
     add_drop(app, set);
+    add_pack(app, set);
+    add_unpack(app, set);
     add_repair(app, set);
 }
 

@@ -14,6 +14,7 @@
 
 #include "hold.h"
 #include "interrupt.h"
+#include "staging.h"
 #include "tree.h"
 #include "verbs.h"
 
@@ -78,35 +79,61 @@ bool repair_table(const common_options & common, const place & where)
 
 } // namespace
 
-exit_code run_repair(const common_options & common, const tables_options & options)
-{
-    std::vector<place> places;
-    for (const std::string & path : options.tables) {
-        if (is_directory(path))
-            for (const std::string & table : tables_to_repair(path))
-                places.push_back(find_place(table));
-        else
-            places.push_back(find_place(path));
-    }
-    note_interrupts();
-    std::size_t removed = 0;
-    exit_code   result  = exit_code::done;
-    for (const place & where : places) {
+// How far it has come: one that fails doesn't keep the others from being repaired.
+struct progress {
+    const common_options & common;
+    std::size_t            removed = 0;
+    exit_code              result  = exit_code::done;
+
+    template <class Repair> void attempt(Repair && repair)
+    {
+        stop_if_interrupted();
         try {
-            stop_if_interrupted();
-            removed += repair_table(common, where) ? 1 : 0;
+            removed += repair() ? 1 : 0;
         } catch (const failure & what) {
-            if (what.exit() == exit_code::interrupted)
-                throw;
             print_failure(what, common.errors);
             result = what.exit();
         }
     }
-    if (removed != 0 && result != exit_code::done)
-        return exit_code::done_in_part;
-    if (removed == 0 && result == exit_code::done && !common.quiet)
-        say("nothing to repair");
-    return result;
+    [[nodiscard]] exit_code end() const
+    {
+        if (removed == 0 && result == exit_code::done && !common.quiet)
+            say("nothing to repair");
+        return removed != 0 && result != exit_code::done ? exit_code::done_in_part : result;
+    }
+};
+
+// What a killed alter or unpack was making its tables in.
+bool repair_staging(const common_options & common, const std::string & path)
+{
+    if (!common.dry_run)
+        remove_staging(path);
+    if (!common.quiet)
+        say(fmt::format("{}: a leftover directory {} removed", path, common.dry_run ? "would be" : "was"));
+    return true;
+}
+
+exit_code run_repair(const common_options & common, const tables_options & options)
+{
+    std::vector<place>       places;
+    std::vector<std::string> stagings;
+    for (const std::string & path : options.tables) {
+        if (!is_directory(path)) {
+            places.push_back(find_place(path));
+            continue;
+        }
+        for (const std::string & table : tables_to_repair(path))
+            places.push_back(find_place(table));
+        for (const std::string & staging : leftover_stagings(path))
+            stagings.push_back(staging);
+    }
+    note_interrupts();
+    progress so_far{common};
+    for (const place & where : places)
+        so_far.attempt([&] { return repair_table(common, where); });
+    for (const std::string & path : stagings)
+        so_far.attempt([&] { return repair_staging(common, path); });
+    return so_far.end();
 }
 
 } // namespace ktrg

@@ -66,6 +66,26 @@ struct tables_options {
     std::vector<std::string> tables;
 };
 
+struct alter_options {
+    std::string              table;
+    std::vector<std::string> add;      // name:type[:flags][=default],...
+    std::vector<std::string> drop;     // names
+    std::vector<std::string> rename;   // a=b
+    std::vector<std::string> defaults; // a=v
+};
+
+struct pack_options {
+    std::string              file; // "-": standard output
+    std::vector<std::string> tables;
+    std::string              prefix; // registry path of the tables' directories
+};
+
+struct unpack_options {
+    std::string file; // "-": standard input
+    std::string directory;
+    bool        info = false;
+};
+
 struct import_options {
     std::string              table;
     std::string              file;
@@ -104,9 +124,12 @@ struct rm_options {
 [[nodiscard]] exit_code run_create(const common_options & common, const create_options & options);
 [[nodiscard]] exit_code run_put(const common_options & common, const put_options & options);
 [[nodiscard]] exit_code run_rm(const common_options & common, const rm_options & options);
+[[nodiscard]] exit_code run_alter(const common_options & common, const alter_options & options);
 [[nodiscard]] exit_code run_cp(const common_options & common, const copy_options & options);
 [[nodiscard]] exit_code run_mv(const common_options & common, const copy_options & options);
 [[nodiscard]] exit_code run_drop(const common_options & common, const tables_options & options);
 [[nodiscard]] exit_code run_repair(const common_options & common, const tables_options & options);
+[[nodiscard]] exit_code run_pack(const common_options & common, const pack_options & options);
+[[nodiscard]] exit_code run_unpack(const common_options & common, const unpack_options & options);
 
 } // namespace ktrg

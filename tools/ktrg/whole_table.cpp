@@ -95,9 +95,10 @@ void copy_table(table & from, const place & to, bool overwrite)
 {
     const stopwatch     time;
     const reserved_name name(to.file);
-    from.tree_of().mount(to, target_mount_point);
-    check(rg_copy_table_by_handle_1(from.handle(), writable(registry_path_at(target_mount_point, to.file_name)),
-                                    overwrite ? 1 : 0),
+    // An unpacked table has a path of somebody else's choice, which can't be below a mount point.
+    const char * p_at = from.where().registry_path.starts_with(target_mount_point) ? mount_point : target_mount_point;
+    from.tree_of().mount(to, p_at);
+    check(rg_copy_table_by_handle_1(from.handle(), writable(registry_path_at(p_at, to.file_name)), overwrite ? 1 : 0),
           to);
     struct stat status {
     };
