@@ -117,7 +117,7 @@ class planner
     // A column that is there and isn't dropped. The library changes names and defaults only where nothing is invisible.
     column & remaining(const std::string & name, const char * p_option)
     {
-        find_column(columns_, name, subject_);
+        (void)find_column(columns_, name, subject_);
         for (const column & each : columns_)
             if ((each.qualifier & RG_INVISIBLE) != 0)
                 refuse(subject_, fmt::format("{} can't be done while the table has the invisible column \"{}\"",
