@@ -122,12 +122,14 @@ bool arena::expects_in_time(const contestant & c, const std::string & what)
     if (past.empty())
         return true;
     const auto [rows, seconds] = past.back();
-    double power               = 1; // of the growth: 1 if time goes with the rows, 2 if with their square
+    double power               = 1; // of the growth: 1 if time goes with the rows
     if (past.size() > 1) {
         const auto [rows_before, seconds_before] = past[past.size() - 2];
         power =
             std::log(seconds / seconds_before) / std::log(static_cast<double>(rows) / static_cast<double>(rows_before));
     }
+    if (power > 1.2)
+        power = std::max(power, 2.0); // a square, of which what costs the same at every size hides some
     const double growth   = static_cast<double>(p_data_->size()) / static_cast<double>(rows);
     const double expected = seconds * std::pow(growth, power);
     if (expected <= options_.patience)
