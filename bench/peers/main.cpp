@@ -36,7 +36,12 @@ bool in_memory(const std::string & directory)
     return statfs(directory.c_str(), &status) == 0 && status.f_type == TMPFS_MAGIC;
 }
 
-constexpr std::pair<const char *, void (*)(arena &)> groups[] = {
+struct group {
+    const char * name;
+    void (*run)(arena &);
+};
+
+constexpr group groups[] = {
     {"the machine", run_machine_limits},
     {"transactions of one row", run_durable},
     {"batches", run_batches},
@@ -46,8 +51,17 @@ constexpr std::pair<const char *, void (*)(arena &)> groups[] = {
     {"updates", run_updated},
 };
 
+// A file whose directory lacks would be noticed too late.
+void make_directories(const outputs & to)
+{
+    for (const std::string & file : {to.csv, to.markdown})
+        if (const auto directory = std::filesystem::path(file).parent_path(); !directory.empty())
+            std::filesystem::create_directories(directory);
+}
+
 void run(const options & o, const outputs & to)
 {
+    make_directories(to);
     if (in_memory(o.directory))
         fmt::print(stderr, "peers: {} has no disk below it: what is durable there costs nothing\n", o.directory);
     results figures;
@@ -55,10 +69,10 @@ void run(const options & o, const outputs & to)
     for (const std::size_t size : o.sizes) {
         const data_set data(size);
         a.begin(data);
-        for (const auto & [p_name, run_group] : groups) {
-            const double seconds = seconds_of(clock_kind::wall, [&] { run_group(a); });
+        for (const group & g : groups) {
+            const double seconds = seconds_of(clock_kind::wall, [&] { g.run(a); });
             if (seconds > 0.05) // else nothing of it was asked for
-                fmt::print(stderr, "peers: {} rows: {}, {:.1f} s\n", size, p_name, seconds);
+                fmt::print(stderr, "peers: {} rows: {}, {:.1f} s\n", size, g.name, seconds);
         }
     }
     print_table(figures);

@@ -5,10 +5,8 @@
 // memory too; the memory statistics, which cost a mutex each time, are off. A connection is used by one thread only,
 // and says so. The journal is truncated rather than deleted, which is as fast as keeping it and disturbs readers less.
 // A row that is read alone is read in the transaction that a statement makes by itself.
-#include <cstddef>
 #include <map>
 #include <mutex>
-#include <type_traits>
 
 #include <fmt/format.h>
 #include <sqlite3.h>
