@@ -161,10 +161,8 @@ BENCHMARK_CAPTURE(add_in_memory, hashed_key, key::hashed)
     ->Arg(1000000)
     ->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(add_in_memory, key_that_is_not_checked, key::unchecked)->Arg(100000)->Unit(benchmark::kMillisecond);
-BENCHMARK_CAPTURE(add_in_memory, key_without_hash_table, key::checked)
-    ->Arg(10000)
-    ->Arg(100000)
-    ->Unit(benchmark::kMillisecond);
+// More rows of such a key take too long to make: each added row looks at all rows ahead of it.
+BENCHMARK_CAPTURE(add_in_memory, key_without_hash_table, key::checked)->Arg(10000)->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(drop_in_memory, hashed_key, key::hashed)->Arg(1000)->Arg(100000)->Unit(benchmark::kMillisecond);
 BENCHMARK(add_in_a_file)->Arg(1000)->Arg(100000)->Unit(benchmark::kMillisecond);
 BENCHMARK(drop_in_a_file)->Arg(1000)->Arg(100000)->Unit(benchmark::kMillisecond);
