@@ -50,6 +50,8 @@ static_assert(sizeof(rg_i_change_entry_t) == 28 && offsetof(rg_i_change_entry_t,
 
 inline constexpr kt_uint32_t RG_I_IO_VECTOR_ELEMENTS = 16;
 
+struct rg_i_key_index_t;
+
 struct rg_i_table_struct_t {
     kt_char_ptr_t p_name;   // key in p_tables; the file's path for a persistent table; NULL: unnamed. Owned; guarded
                             // by the tree's lock
@@ -101,6 +103,8 @@ struct rg_i_table_struct_t {
     rg_i_read_write_lock_t        lock;
     rg_i_record_buffer_pool_t     record_buffer_pool;
     struct iovec                  io_vector[RG_I_IO_VECTOR_ELEMENTS]; // scratch for gathering writes
+    rg_i_key_index_t *            p_key_index; // leads to keys where there is no hash table; owned; NULL: none
+    kt_uint64_t key_walk_rows;                 // rows that walks over the keys have looked at, while there is no index
     kt_uint32_t phantom_references; // of references, those that no handle stands for; guarded by the tree's lock
 };
 using rg_i_table_t = rg_i_table_struct_t;

@@ -10,6 +10,7 @@
 #include "rg_i_table.h"
 #include "rows/rg_i_arguments.h"
 #include "rows/rg_i_row_builder.h"
+#include "table/rg_i_key_index.h"
 
 namespace
 {
@@ -110,11 +111,13 @@ void undo_slot(rg_i_table_t * p_table, rg_i_index_entry_t * p_index_entry,
 //
 // Kept because callers depend on it: the slot just taken is read like any other, though the count doesn't include it
 // yet. So a slot that is reused below a live row is reached, and there the new key matches itself: the add fails.
-[[nodiscard]] bool scan_finds_key(const rg_i_table_t * p_table, const kt_value_t * p_input_key_value)
+[[nodiscard]] bool scan_finds_key(const rg_i_table_t * p_table, const kt_value_t * p_input_key_value,
+                                  kt_uint32_t * p_rows_visited)
 {
     const kt_data_type_t key_type   = p_table->p_columns[0].type;
     const kt_uint32_t    total_live = p_table->total_applied_rows - p_table->applied_deletions;
-    for (kt_uint32_t visited = 0, slot = 0; visited < total_live && slot < p_table->maximum_rows; ++slot) {
+    kt_uint32_t &        visited    = *p_rows_visited;
+    for (kt_uint32_t slot = 0; visited < total_live && slot < p_table->maximum_rows; ++slot) {
         kt_char_ptr_t p_record = p_table->p_rows_fixed_index[slot].p_applied;
         if (p_record == nullptr)
             continue;
@@ -125,6 +128,18 @@ void undo_slot(rg_i_table_t * p_table, rg_i_index_entry_t * p_index_entry,
             return true;
     }
     return false;
+}
+
+// The outcome of that walk.
+[[nodiscard]] bool key_exists(rg_i_table_t * p_table, const kt_value_t * p_input_key_value, kt_uint32_t new_slot)
+{
+    if (const rg_i_key_answer answer = rg_i_key_index_find_duplicate(p_table, *p_input_key_value, new_slot);
+        answer != rg_i_key_answer::unknown)
+        return answer == rg_i_key_answer::present;
+    kt_uint32_t rows_visited = 0;
+    const bool  found        = scan_finds_key(p_table, p_input_key_value, &rows_visited);
+    rg_i_key_index_note_walk(p_table, rows_visited, 1);
+    return found;
 }
 
 // Enters the slot's key into the hash table, or finds the slot of an equal key whose row's deletion is pending: that
@@ -203,10 +218,13 @@ kt_int32_t rg_i_add_row_raw(rg_i_table_t * p_table, kt_char_ptr_t p_record_data,
     if (p_table->p_rows_hash_table != nullptr) {
         if (const kt_int32_t rc = enter_key(p_table, p_record_data, &p_index_entry, &p_existing_element); rc != 0)
             return rc;
-    } else if ((p_table->p_columns[0].qualifier & 15u) == RG_PRIMARY_KEY &&
-               scan_finds_key(p_table, p_input_key_value)) {
-        rg_i_rows_free_chain_insert(p_table, p_index_entry);
-        return rg_i_fail(RG_HERE, RG_E_DUPLICATE_KEY);
+    } else {
+        const kt_uint32_t slot = rg_i_fixed_row_index(p_table, p_index_entry);
+        if ((p_table->p_columns[0].qualifier & 15u) == RG_PRIMARY_KEY && key_exists(p_table, p_input_key_value, slot)) {
+            rg_i_rows_free_chain_insert(p_table, p_index_entry);
+            return rg_i_fail(RG_HERE, RG_E_DUPLICATE_KEY);
+        }
+        rg_i_key_index_note_record(p_table, slot);
     }
 
     *p_p_new_index_entry             = p_index_entry;

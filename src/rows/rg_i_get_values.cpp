@@ -13,6 +13,7 @@
 #include "frame/rg_i_trace.h"
 #include "rg_i_table.h"
 #include "rows/rg_i_arguments.h"
+#include "table/rg_i_key_index.h"
 
 namespace
 {
@@ -106,13 +107,14 @@ template <class T> [[nodiscard]] kt_int32_t compare_floats(T client, T stored)
 // record goes ahead of the applied one, so that an updated row is found under its committed key, and a row whose
 // deletion is pending is found at all.
 [[nodiscard]] kt_uint32_t scan_for_key(const rg_i_table_t * p_table, const kt_value_t & row_key,
-                                       kt_data_type_t key_type)
+                                       kt_data_type_t key_type, kt_uint32_t * p_rows_visited)
 {
     const kt_uint32_t total_applied_rows = p_table->total_applied_rows;
     for (kt_uint32_t row_index = 0; row_index < total_applied_rows; ++row_index) {
         const kt_uint32_t          fixed_row_index = p_table->p_rows_packed_index[row_index];
         const rg_i_index_entry_t & entry           = p_table->p_rows_fixed_index[fixed_row_index];
-        const kt_char_ptr_t        p_record        = entry.p_committed != nullptr ? entry.p_committed : entry.p_applied;
+        *p_rows_visited                            = row_index + 1;
+        const kt_char_ptr_t p_record               = entry.p_committed != nullptr ? entry.p_committed : entry.p_applied;
         if (p_record == nullptr)
             continue;
         if (rg_i_compare_values_within(&row_key, rg_i_row_slot(p_record, 0), key_type,
@@ -121,6 +123,18 @@ template <class T> [[nodiscard]] kt_int32_t compare_floats(T client, T stored)
             return fixed_row_index;
     }
     return p_table->maximum_rows;
+}
+
+// The outcome of that walk.
+[[nodiscard]] kt_uint32_t find_key(rg_i_table_t * p_table, const kt_value_t & row_key, kt_data_type_t key_type)
+{
+    kt_uint32_t fixed_row_index = p_table->maximum_rows;
+    if (rg_i_key_index_find(p_table, row_key, &fixed_row_index) != rg_i_key_answer::unknown)
+        return fixed_row_index;
+    kt_uint32_t rows_visited = 0;
+    fixed_row_index          = scan_for_key(p_table, row_key, key_type, &rows_visited);
+    rg_i_key_index_note_walk(p_table, rows_visited, 0);
+    return fixed_row_index;
 }
 
 } // namespace
@@ -252,7 +266,7 @@ kt_int32_t rg_i_get_fixed_row_index_for_key(rg_i_table_t * p_table, kt_value_t r
         return rc;
     }
 
-    const kt_uint32_t fixed_row_index = scan_for_key(p_table, row_key, key_type);
+    const kt_uint32_t fixed_row_index = find_key(p_table, row_key, key_type);
     if (fixed_row_index == p_table->maximum_rows) {
         trace_key_not_found(RG_HERE, p_table->p_name, row_key, key_type);
         return RG_E_NO_SUCH_KEY;

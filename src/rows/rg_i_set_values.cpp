@@ -11,6 +11,7 @@
 #include "rg_i_table.h"
 #include "rows/rg_i_arguments.h"
 #include "rows/rg_i_row_builder.h"
+#include "table/rg_i_key_index.h"
 
 namespace
 {
@@ -65,6 +66,7 @@ void replace_applied_record(rg_i_table_t * p_table, rg_i_index_entry_t * p_index
 {
     kt_char_ptr_t p_from_record = p_index_entry->p_applied;
     p_index_entry->p_applied    = p_new_record;
+    rg_i_key_index_note_replacement(p_table, rg_i_fixed_row_index(p_table, p_index_entry), p_from_record, p_new_record);
     if (p_from_record == p_index_entry->p_committed)
         return;
     // The key of a row that isn't committed yet stands in the record that goes. The element of a committed row points

@@ -13,6 +13,7 @@
 
 #include "frame/rg_i_trace.h"
 #include "rg_i_table.h"
+#include "table/rg_i_key_index.h"
 
 namespace
 {
@@ -99,6 +100,8 @@ void rg_i_swap_with_room(rg_i_table_t * p_table, rg_i_table_t * p_new_table)
     fit_packed_index(*p_table, p_new_table->maximum_rows);
     drop_pending(*p_table);
     drop_pending(*p_new_table);
+    rg_i_key_index_drop(p_table);
+    rg_i_key_index_drop(p_new_table);
     exchange_fields(*p_table, *p_new_table);
 }
 

@@ -9,12 +9,14 @@
 #include <cstdlib>
 
 #include "rg_i_table.h"
+#include "table/rg_i_key_index.h"
 
 kt_int32_t rg_i_close_table(rg_i_table_t * p_table)
 {
     rg_i_rw_close(&p_table->lock);
     rg_i_rb_uninitialize_record_buffer_pool(&p_table->record_buffer_pool);
     rg_i_hash_table_close(p_table->p_rows_hash_table);
+    rg_i_key_index_drop(p_table);
     std::free(p_table->p_rows_fixed_index);
     std::free(p_table->p_rows_packed_index);
     rg_i_free_change_lists(p_table);
