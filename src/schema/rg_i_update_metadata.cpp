@@ -13,15 +13,12 @@
 #include "frame/rg_i_guards.h"
 #include "frame/rg_i_trace.h"
 #include "schema/rg_i_column_changes.h"
-#include "schema/rg_i_distinct_keys.h"
 #include "schema/rg_i_get_table_metadata.h"
 
 namespace
 {
 
 constexpr char module_version[] = "rg_i_update_metadata 1.0";
-
-constexpr kt_uint32_t qualifier_kind_mask = 15;
 
 // What is asked for, and of which table.
 struct change_t {
@@ -94,12 +91,6 @@ template <class T> [[nodiscard]] bool allocate(owned_ptr<T> & array, kt_uint64_t
 
 // ---- The rows ----
 
-// Only a damaged file has its key elsewhere.
-[[nodiscard]] bool key_is_the_first_column_of(const rg_i_table_t & table)
-{
-    return (table.p_columns[0].qualifier & qualifier_kind_mask) == RG_PRIMARY_KEY;
-}
-
 // Carries rows from one table to another, which has the same columns and perhaps more. p_to_columns begins with these, in
 // the order that they have in the first table: their names may differ, and so may their places where a damaged file has
 // its key elsewhere than in front.
@@ -158,20 +149,6 @@ class row_carrier
     return 0;
 }
 
-// Without a hash table each add looks at all rows ahead of it for an equal key, which would cost the square of the rows.
-// Where none can be found, the new table's key goes unchecked meanwhile.
-[[nodiscard]] kt_int32_t carry_rows_in_linear_time(rg_i_table_t & from, rg_i_table_t & to,
-                                                   const rg_column_t * p_to_columns)
-{
-    rg_column_t &        key       = to.p_columns[0];
-    const rg_qualifier_t qualifier = key.qualifier;
-    if (to.p_rows_hash_table == nullptr && key_is_the_first_column_of(from) && rg_i_keys_are_distinct(&from))
-        key.qualifier = (qualifier & ~qualifier_kind_mask) | RG_PRIMARY_KEY_NOCHECK;
-    const kt_int32_t rc = carry_rows(from, to, p_to_columns);
-    key.qualifier       = qualifier;
-    return rc;
-}
-
 [[nodiscard]] kt_int32_t build(const change_t & change, const rg_table_metadata_t & described,
                                rg_i_table_t ** p_result_table)
 {
@@ -181,7 +158,7 @@ class row_carrier
     rg_i_table_t * p_new_table = nullptr;
     if (const kt_int32_t rc = create_table(change, columns.get(), &p_new_table); rc != 0)
         return rc;
-    if (const kt_int32_t rc = carry_rows_in_linear_time(change.table, *p_new_table, columns.get()); rc != 0) {
+    if (const kt_int32_t rc = carry_rows(change.table, *p_new_table, columns.get()); rc != 0) {
         rg_i_close_table(p_new_table);
         return rc;
     }

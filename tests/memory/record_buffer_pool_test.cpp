@@ -977,7 +977,7 @@ TEST(any_sequence_of_calls, does_what_walking_the_chain_does_in_many_small_block
 TEST(any_sequence_of_calls, does_what_walking_the_chain_does_in_a_grown_pool)
 {
     model m(15);
-    m.run(60000, 999, 6000, 2000);
+    m.run(60000, 999, 15000, 5000);
     EXPECT_GT(m.blocks(), 20u);
 }
 
