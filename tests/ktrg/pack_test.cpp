@@ -285,7 +285,7 @@ TEST(unpacking, wants_a_directory_that_is_there_or_info)
     EXPECT_EQ(at.run({"unpack", "p", ".", "--info"}).code, 2);
     expect_result(at.run({"unpack", "p", "nowhere"}), 3, "ktrg: nowhere: no such directory\n");
     EXPECT_FALSE(at.exists("nowhere"));
-    expect_result(at.run({"unpack", "nothing", "."}), 3, "ktrg: nothing: nothing: No such file or directory\n");
+    expect_result(at.run({"unpack", "nothing", "."}), 3, "ktrg: nothing: No such file or directory\n");
     at.write("locked/.keep", "");
     ASSERT_EQ(chmod(at.file("locked").c_str(), 0555), 0);
     EXPECT_EQ(at.run({"unpack", "p", "locked"}).code, 8);

@@ -229,6 +229,14 @@ bool is_column_name(std::string_view name)
            std::all_of(name.begin(), name.end(), [&](char c) { return is_letter(c) || is_digit(c) || c == '_'; });
 }
 
+failure protected_column(const column & of, std::string_view table_name, std::string_view context)
+{
+    return failure(exit_code::not_permitted, std::string(table_name),
+                   fmt::format("{}{}column \"{}\" is protected: it can't be updated", context,
+                               context.empty() ? "" : ": ", of.name),
+                   RG_E_INVALID_COLUMN);
+}
+
 std::size_t find_column(const std::vector<column> & columns, std::string_view name, std::string_view table_name)
 {
     for (std::size_t i = 0; i < columns.size(); i++)

@@ -89,6 +89,10 @@ struct column {
 // Whether the registry takes the name: a letter, then letters, digits and '_', 255 at most.
 [[nodiscard]] bool is_column_name(std::string_view name);
 
+// The failure for an update of a column that is protected. `context` goes in front of the text if it isn't empty.
+class failure;
+[[nodiscard]] failure protected_column(const column & of, std::string_view table_name, std::string_view context = {});
+
 // The position of the column, or a failure that suggests the nearest name.
 [[nodiscard]] std::size_t              find_column(const std::vector<column> & columns, std::string_view name,
                                                    std::string_view table_name);

@@ -5,46 +5,40 @@
 // as RFC 4180 has it.
 #include "csv_reader.h"
 
-#include <cerrno>
-#include <cstring>
+#include <new>
 
 #include <csv.h>
-#include <fcntl.h>
 #include <fmt/format.h>
-#include <unistd.h>
 
 #include "failure.h"
-#include "interrupt.h"
 
 namespace ktrg
 {
 
+namespace
+{
+
 struct csv_builder {
-    csv_text      result;
+    text_rows     result;
     std::uint64_t line        = 1;    // of the bytes that are being fed
     std::uint64_t record_line = 1;    // where the record under way began
-    std::size_t   first_cell  = 0;    // of the record under way
     bool          between     = true; // no record is under way
 
     static void on_cell(void * p_text, std::size_t length, void * p_builder)
     {
         auto & self = *static_cast<csv_builder *>(p_builder);
         if (p_text != nullptr)
-            self.result.text_.append(static_cast<const char *>(p_text), length);
-        self.result.ends_.push_back(self.result.text_.size());
-        self.result.missing_.push_back(p_text == nullptr);
+            self.result.add_cell(text_kind::plain, {static_cast<const char *>(p_text), length});
+        else
+            self.result.add_cell(text_kind::missing, {});
     }
     static void on_record(int, void * p_builder)
     {
         auto & self = *static_cast<csv_builder *>(p_builder);
-        self.result.records_.push_back({self.record_line, self.first_cell});
-        self.first_cell = self.result.ends_.size();
-        self.between    = true;
+        self.result.end_row(self.record_line);
+        self.between = true;
     }
 };
-
-namespace
-{
 
 int no_space(unsigned char)
 {
@@ -53,11 +47,10 @@ int no_space(unsigned char)
 
 struct parser_owner {
     csv_parser parser{};
-    explicit parser_owner(char separator)
+    parser_owner()
     {
         if (csv_init(&parser, CSV_STRICT | CSV_STRICT_FINI | CSV_EMPTY_IS_NULL) != 0)
             throw std::bad_alloc();
-        csv_set_delim(&parser, static_cast<unsigned char>(separator));
         csv_set_space_func(&parser, no_space);
     }
     ~parser_owner() { csv_free(&parser); }
@@ -83,19 +76,17 @@ bool is_blank(std::string_view line)
 
 } // namespace
 
-csv_text csv_text::parse(std::string_view text, char separator, const std::string & subject,
-                         const std::string & file_name)
+text_rows read_csv(std::string_view text, const std::string & subject, const std::string & file_name)
 {
     constexpr std::string_view byte_order_mark = "\xef\xbb\xbf";
     if (text.starts_with(byte_order_mark))
         text.remove_prefix(byte_order_mark.size());
 
     csv_builder  builder;
-    parser_owner owner(separator);
+    parser_owner owner;
     csv_parser & parser = owner.parser;
     const auto   refuse = [&](std::uint64_t line) {
-        const int error = csv_error(&parser);
-        if (error == CSV_ENOMEM)
+        if (csv_error(&parser) == CSV_ENOMEM)
             throw std::bad_alloc();
         throw failure(
               exit_code::usage, subject,
@@ -116,50 +107,6 @@ csv_text csv_text::parse(std::string_view text, char separator, const std::strin
     if (csv_fini(&parser, csv_builder::on_cell, csv_builder::on_record, &builder) != 0)
         refuse(builder.record_line);
     return std::move(builder.result);
-}
-
-std::size_t csv_text::cells_of(std::size_t record) const
-{
-    const std::size_t end = record + 1 < records_.size() ? records_[record + 1].first_cell : ends_.size();
-    return end - records_[record].first_cell;
-}
-
-csv_text::csv_cell csv_text::at(std::size_t record, std::size_t i) const
-{
-    const std::size_t position = records_[record].first_cell + i;
-    const std::size_t start    = position == 0 ? 0 : ends_[position - 1];
-    return {std::string_view(text_).substr(start, ends_[position] - start), missing_[position]};
-}
-
-std::string read_whole(const std::string & file_name, const std::string & subject)
-{
-    const bool is_input = file_name == "-";
-    const int  fd       = is_input ? STDIN_FILENO : open(file_name.c_str(), O_RDONLY | O_CLOEXEC);
-    if (fd < 0)
-        throw failure(errno == ENOENT   ? exit_code::not_found
-                      : errno == EACCES ? exit_code::not_permitted
-                                        : exit_code::input_output,
-                      subject, fmt::format("{}: {}", file_name, std::strerror(errno)));
-    std::string           text;
-    constexpr std::size_t step  = 1U << 18;
-    std::size_t           total = 0;
-    for (;;) {
-        text.resize(total + step);
-        const ssize_t got   = read(fd, text.data() + total, step);
-        const int     error = errno;
-        if (got < 0 && error == EINTR && !interrupted())
-            continue;
-        if (got <= 0 && !is_input)
-            close(fd);
-        stop_if_interrupted();
-        if (got < 0)
-            throw failure(exit_code::input_output, subject, fmt::format("{}: {}", file_name, std::strerror(error)));
-        if (got == 0)
-            break;
-        total += static_cast<std::size_t>(got);
-    }
-    text.resize(total);
-    return text;
 }
 
 } // namespace ktrg

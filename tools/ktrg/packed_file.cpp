@@ -12,10 +12,10 @@
 
 #include <fmt/format.h>
 
-#include "csv_reader.h"
 #include "failure.h"
 #include "key_hash.h"
 #include "kt_pmsg.h"
+#include "text_rows.h"
 
 namespace ktrg
 {
@@ -84,7 +84,7 @@ packed_file packed_file::read(const std::string & file)
 {
     packed_file result;
     result.name_    = file == "-" ? "standard input" : file;
-    result.content_ = read_whole(file, result.name_);
+    result.content_ = read_whole(file, "");
     result.check_header();
     void *      p_buffer = result.content_.data();
     kt_uint32_t count    = 0;

@@ -34,6 +34,7 @@ struct settings {
     get_options    get;
     select_options select;
     import_options import;
+    export_options exports;
     create_options create;
     put_options    put;
     rm_options     rm;

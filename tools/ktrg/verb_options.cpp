@@ -98,19 +98,39 @@ void add_select(CLI::App & app, settings & set)
 void add_import(CLI::App & app, settings & set)
 {
     import_options & options = set.import;
-    CLI::App * p_verb = add_verb(app, set, "import", "Write", "Add the rows of a file, in one transaction", run_import,
-                                 options, {"import state/hosts hosts.csv --create --key name --types load:float32"});
+    CLI::App *       p_verb  = add_verb(
+               app, set, "import", "Write", "Add the rows of a file, in one transaction", run_import, options,
+               {"import state/hosts hosts.csv --create --key name --types load:float32",
+                "import state/hosts new.jsonl --on-conflict update --rejects bad.jsonl",
+                "export state/hosts -o jsonl | ktrg import copy - --format jsonl --create"},
+               {"A cell that is missing takes the column's default, or keeps the row's value in an update. JSON is an",
+                "array of objects or one object, and JSONL an object a line; objects within need --types. TSV has no",
+                "quotes: \\t, \\n, \\r and \\\\ stand for a tab, line ends and a backslash.", "",
+                "Without --rejects a row that can't be had ends the import, and nothing is changed. With it the others",
+                "go in, and the exit code is 10. The file of rejected rows has the input's form, and the reason in a",
+                "column reject_reason; leave that out with --map reject_reason= when they come again."});
     add_table(*p_verb, options.table);
-    p_verb->add_option("FILE", options.file, "CSV file; - is standard input")->required();
-    p_verb->add_option("--format", options.format, "csv or tsv; without it the file's name decides")
-        ->check(one_of({"csv", "tsv"}))
+    p_verb->add_option("FILE", options.file, "The file; - is standard input")->required();
+    p_verb->add_option("--format", options.format, "csv, tsv, json or jsonl; without it the file's name decides")
+        ->check(one_of({"csv", "tsv", "json", "jsonl"}))
         ->type_name("FORM");
     p_verb->add_flag("--create", options.create, "Make the table, with types that fit the file");
     p_verb->add_option("-k,--key", options.key, "The new table's key; the first column without it")->type_name("COL");
     p_verb->add_option("-t,--types", options.types, "Types that are not to be detected, as name:type[:flags][=default]")
         ->type_name("COL:TYPE,...")
         ->allow_extra_args(false);
-    add_list(*p_verb, "--map", options.renamed, "The file's column FROM is the table's TO", "FROM=TO,...");
+    add_list(*p_verb, "--map", options.renamed, "The file's column FROM is the table's TO; FROM= leaves it out",
+             "FROM=TO,...");
+    p_verb
+        ->add_option("--on-conflict", options.on_conflict,
+                     "A row whose key exists: error, update (set its columns) or skip")
+        ->check(one_of({"error", "update", "skip"}))
+        ->type_name("HOW");
+    p_verb->add_option("--batch", options.batch, "Make each N rows a transaction of their own")
+        ->check(CLI::PositiveNumber.description(""))
+        ->type_name("N");
+    p_verb->add_option("--rejects", options.rejects, "Put rows that can't be had into this file, and go on")
+        ->type_name("FILE");
 }
 
 void add_put(CLI::App & app, settings & set)
@@ -209,6 +229,17 @@ void add_drop(CLI::App & app, settings & set)
 
 // ---- Whole ----
 
+void add_export(CLI::App & app, settings & set)
+{
+    CLI::App * p_verb =
+        add_verb(app, set, "export", "Whole", "Write all rows for other programs", run_export, set.exports,
+                 {"export state/hosts > hosts.csv", "export state/hosts -o jsonl --columns name,load"},
+                 {"As csv, or as -o says: tsv, json, jsonl or markdown. All columns, invisible ones too; import takes",
+                  "csv, tsv, json and jsonl back."});
+    add_table(*p_verb, set.exports.table);
+    add_list(*p_verb, "-c,--columns", set.exports.columns, "Columns to write, separated by commas", "COL,...");
+}
+
 void add_pack(CLI::App & app, settings & set)
 {
     pack_options & options = set.pack;
@@ -270,6 +301,7 @@ void add_verbs(CLI::App & app, settings & set)
     add_cp(app, set);
     add_mv(app, set);
     add_drop(app, set);
+    add_export(app, set);
     add_pack(app, set);
     add_unpack(app, set);
     add_repair(app, set);

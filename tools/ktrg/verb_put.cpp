@@ -69,9 +69,7 @@ void update(const table & to, assignments & given)
 {
     for (const column * p_column : given.columns)
         if (!p_column->is_key() && (p_column->qualifier & RG_PROTECTED) != 0)
-            throw failure(exit_code::not_permitted, to.where().name,
-                          fmt::format("column \"{}\" is protected: it can't be updated", p_column->name),
-                          RG_E_INVALID_COLUMN);
+            throw protected_column(*p_column, to.where().name);
     std::vector<kt_char_ptr_t> names;
     std::vector<kt_value_t *>  addresses;
     given.arrays(false, names, addresses);

@@ -90,10 +90,18 @@ struct import_options {
     std::string              table;
     std::string              file;
     std::string              format; // empty: by the file's name, csv if that says nothing
+    std::string              on_conflict = "error";
+    std::string              rejects;    // empty: a row that can't be had ends the import
+    std::size_t              batch  = 0; // 0: all rows are one transaction
     bool                     create = false;
     std::string              key;
     std::vector<std::string> types;   // name:type[:flags][=default],...
-    std::vector<std::string> renamed; // a=b: the file's column a is the table's b
+    std::vector<std::string> renamed; // a=b: the file's column a is the table's b; a=: it is left out
+};
+
+struct export_options {
+    std::string              table;
+    std::vector<std::string> columns;
 };
 
 struct create_options {
@@ -121,6 +129,7 @@ struct rm_options {
 [[nodiscard]] exit_code run_get(const common_options & common, const get_options & options);
 [[nodiscard]] exit_code run_select(const common_options & common, const select_options & options);
 [[nodiscard]] exit_code run_import(const common_options & common, const import_options & options);
+[[nodiscard]] exit_code run_export(const common_options & common, const export_options & options);
 [[nodiscard]] exit_code run_create(const common_options & common, const create_options & options);
 [[nodiscard]] exit_code run_put(const common_options & common, const put_options & options);
 [[nodiscard]] exit_code run_rm(const common_options & common, const rm_options & options);
