@@ -240,6 +240,29 @@ TEST(altering, that_is_interrupted_leaves_the_table_as_it_was)
     EXPECT_EQ(names_in(at), 1U);
 }
 
+TEST(altering, that_is_killed_at_any_moment_leaves_the_old_table_or_the_new_one_and_repair_the_rest)
+{
+    const std::string old_schema = "id:int64:key\nn:int64\n";
+    const std::string new_schema = old_schema + "note:string=x\n";
+    scratch           at;
+    std::string       text = "id,n\n";
+    for (int i = 0; i < 2000; i++)
+        text += std::to_string(i) + ",1\n";
+    for (int moment = 0; moment < 12; moment++) {
+        ASSERT_EQ(at.run({"import", "hosts", "-", "--create", "-q"}, text).code, 0);
+        const scratch::running alter = at.start({"alter", "hosts", "--add", "note:string=x"});
+        std::this_thread::sleep_for(std::chrono::milliseconds(8 * moment));
+        kill(alter.pid, SIGKILL);
+        (void)at.finish(alter);
+        const std::string schema = schema_of(at);
+        EXPECT_TRUE(schema == old_schema || schema == new_schema) << schema;
+        EXPECT_EQ(at.run({"select", "hosts", "--count"}).out, "2000\n");
+        EXPECT_EQ(at.run({"repair", ".", "-q"}).code, 0);
+        EXPECT_EQ(names_in(at), 1U) << moment;
+        ASSERT_EQ(at.run({"drop", "hosts", "-f"}).code, 0);
+    }
+}
+
 TEST(altering, without_room_on_the_disk_is_7_and_leaves_the_table_as_it_was)
 {
     scratch     at;

@@ -497,6 +497,15 @@ TEST(verbose, tells_what_is_opened_and_written_with_rows_bytes_counter_and_time)
                             "ktrg: [0-9.]+ ms in all\n")))
         << put.err;
     EXPECT_EQ(at.run({"select", "hosts", "-v", "--count"}).out, "3\n");
+    const result made = at.run({"create", "t", "id:int32:key", "-v", "-q"});
+    EXPECT_TRUE(
+        std::regex_match(made.err, std::regex("ktrg: t: created: 0 rows, 1 column, [0-9]+ bytes, counter [0-9]+, "
+                                              "[0-9.]+ ms\nktrg: [0-9.]+ ms in all\n")))
+        << made.err;
+    const result stat = at.run({"stat", "t", "-v"});
+    EXPECT_TRUE(std::regex_search(
+        stat.err, std::regex("^ktrg: t: read record by record: 0 rows, 1 column, [0-9]+ bytes, counter [0-9]+, ")))
+        << stat.err;
 }
 
 } // namespace

@@ -203,14 +203,19 @@ void table::make(const std::string & registry_path, const std::vector<column> & 
 
 table table::create(const place & where, const std::vector<column> & columns, std::uint64_t expected_rows)
 {
-    table       result(where);
-    struct stat status {
+    const stopwatch time;
+    table           result(where);
+    struct stat     status {
     };
     if (stat(where.file.c_str(), &status) == 0)
         throw registry_failure(RG_E_TABLE_EXISTS, where.name);
     result.tree_ = tree(where);
     result.tree_.mount(where, where.mounted_at);
     result.make(where.registry_path, columns, expected_rows);
+    if (verbose()) {
+        result.take_counts();
+        result.tell_open("created", time);
+    }
     return result;
 }
 

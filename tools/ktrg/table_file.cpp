@@ -19,6 +19,7 @@
 
 #include "failure.h"
 #include "json_text.h"
+#include "talk.h"
 #include "values.h"
 
 namespace ktrg
@@ -393,10 +394,15 @@ table_file read_table_file(const std::string & path, const std::string & name)
 {
     // A commit that happens while the walk is under way can lead it beyond the length that it began with. The next
     // attempt begins with the new one.
-    constexpr int attempts = 3;
+    constexpr int   attempts = 3;
+    const stopwatch time;
     for (int attempt = 1;; attempt++) {
         try {
-            return read_once(path, name);
+            table_file result = read_once(path, name);
+            tell(fmt::format("{}: read record by record: {}, {}, {} bytes, counter {}, {}", name,
+                             counted(result.rows, "row"), counted(result.columns.size(), "column"), result.length,
+                             result.counter, time.text()));
+            return result;
         } catch (const failure & what) {
             if (what.code() != RG_E_NO_COMMIT_RECORD || attempt == attempts)
                 throw;
