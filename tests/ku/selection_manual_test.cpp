@@ -50,9 +50,7 @@ std::string trimmed(const std::string & s)
 // The lines of the blocks that are marked as examples, cut at their last "->".
 std::vector<example> examples_of_the_manual()
 {
-    std::string path = __FILE__;
-    path             = path.substr(0, path.rfind("/tests/")) + "/docs/SELECTION.md";
-    std::ifstream        in(path);
+    std::ifstream        in(KT_SOURCE_DIR "/docs/SELECTION.md");
     std::vector<example> result;
     std::string          line;
     bool                 inside = false;

@@ -19,7 +19,7 @@ std::string file_beside(const std::filesystem::path & path)
     return {raw.begin(), raw.end()};
 }
 
-const std::filesystem::path here = std::filesystem::path(__FILE__).parent_path();
+const std::filesystem::path here = std::filesystem::path(KT_SOURCE_DIR) / "tests" / "protocol";
 
 // The bytes of a dump: on each line an offset, pairs of digits, and behind two spaces a note; # opens a heading.
 octets bytes_of_dump(const std::string & dump)

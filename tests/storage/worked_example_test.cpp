@@ -10,12 +10,11 @@ namespace
 // The bytes of the document's dump, without the offsets ahead of each line.
 bytes documented_file()
 {
-    const std::filesystem::path document =
-        std::filesystem::path(__FILE__).parent_path().parent_path().parent_path() / "docs" / "FILE-FORMAT.md";
-    const bytes       raw = read_file(document.string());
-    const std::string all(raw.begin(), raw.end());
-    const std::string fence = "```hexdump\n";
-    const size_t      begin = all.find(fence);
+    const std::filesystem::path document = std::filesystem::path(KT_SOURCE_DIR) / "docs" / "FILE-FORMAT.md";
+    const bytes                 raw      = read_file(document.string());
+    const std::string           all(raw.begin(), raw.end());
+    const std::string           fence = "```hexdump\n";
+    const size_t                begin = all.find(fence);
     EXPECT_NE(begin, std::string::npos);
     std::string digits;
     for (size_t at = begin + fence.size(); all.compare(at, 3, "```") != 0;) {
