@@ -184,6 +184,21 @@ void link_entry(index_t * p_index, kt_uint32_t number)
     return true;
 }
 
+// Calls look(slot) for the slots entered under the hash until it returns true. False: too many, not all were looked at.
+template <class Look> [[nodiscard]] bool for_each_slot(const index_t * p_index, kt_uint32_t hash, Look && look)
+{
+    kt_uint32_t searched = 0;
+    for (kt_uint32_t number = p_index->p_buckets[hash & p_index->bucket_mask]; number != no_entry;
+         number             = p_index->p_entries[number].next) {
+        const entry_t & entry = p_index->p_entries[number];
+        if (++searched > longest_search)
+            return false;
+        if (entry.hash == hash && look(entry.slot))
+            return true;
+    }
+    return true;
+}
+
 // ---- Making ----
 
 // Whether both walks see each row once, where its slot says. A table that was refreshed while it was open keeps a packed
@@ -235,7 +250,14 @@ index_t * current_index(const rg_i_table_t * p_table)
 void enter_or_renew(rg_i_table_t * p_table, const record_key_t & key, kt_uint32_t slot)
 {
     index_t * const p_index = p_table->p_key_index;
-    const bool      stale   = p_index->entry_count / 2 > p_table->total_applied_rows + spare_entries;
+    // A slot that gets a key again, as rows come and go, needn't be entered again.
+    bool entered = false;
+    (void)for_each_slot(p_index, key.hash, [&](kt_uint32_t other) { return entered = other == slot; });
+    if (entered && key.comparable && !key.nan) {
+        p_index->top_slot = std::max(p_index->top_slot, slot);
+        return;
+    }
+    const bool stale = p_index->entry_count / 2 > p_table->total_applied_rows + spare_entries;
     if (!stale && enter(p_index, key, slot))
         return;
     rg_i_key_index_drop(p_table);
@@ -243,21 +265,6 @@ void enter_or_renew(rg_i_table_t * p_table, const record_key_t & key, kt_uint32_
 }
 
 // ---- Finding ----
-
-// Calls look(slot) for the slots entered under the hash until it returns true. False: too many, not all were looked at.
-template <class Look> [[nodiscard]] bool for_each_slot(const index_t * p_index, kt_uint32_t hash, Look && look)
-{
-    kt_uint32_t searched = 0;
-    for (kt_uint32_t number = p_index->p_buckets[hash & p_index->bucket_mask]; number != no_entry;
-         number             = p_index->p_entries[number].next) {
-        const entry_t & entry = p_index->p_entries[number];
-        if (++searched > longest_search)
-            return false;
-        if (entry.hash == hash && look(entry.slot))
-            return true;
-    }
-    return true;
-}
 
 // Whether a row lies above the slot. What is free at the top needn't be looked at again; a row whose deletion is
 // pending may come back.

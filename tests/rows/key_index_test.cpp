@@ -287,6 +287,27 @@ TEST(key_indexes, of_many_equal_keys_leave_it_to_the_walk)
     EXPECT_EQ(find_key(table, uint32(8)), -RG_E_NO_SUCH_KEY);
 }
 
+TEST(key_indexes, are_not_worn_out_by_a_key_that_comes_and_goes)
+{
+    open_tree                tree;
+    const rg_opaque_handle_t table = make_numbers(tree, "/t", RG_PRIMARY_KEY, 100);
+    ASSERT_EQ(commit(table), 0);
+    ASSERT_TRUE(has_index(table));
+    for (int round = 0; round < 200; ++round) {
+        ASSERT_EQ(add_row(table, {{"id", uint32(5000)}}), 0);
+        ASSERT_EQ(commit(table), 0);
+        ASSERT_EQ(set_fields_by_key(table, uint32(5000), {{"id", uint32(6000)}}), 0);
+        ASSERT_EQ(commit(table), 0);
+        kt_uint32_t slot = 0;
+        EXPECT_EQ(rg_i_key_index_find(&object_of(table), uint32(6000), &slot), rg_i_key_answer::present);
+        EXPECT_EQ(slot, 100u);
+        EXPECT_EQ(rg_i_key_index_find(&object_of(table), uint32(5000), &slot), rg_i_key_answer::absent);
+        ASSERT_EQ(rg_delete_row_by_index_1(table, 100), 0);
+        ASSERT_EQ(commit(table), 0);
+        EXPECT_EQ(rg_i_key_index_find(&object_of(table), uint32(6000), &slot), rg_i_key_answer::absent);
+    }
+}
+
 TEST(key_indexes, go_when_a_reader_becomes_a_writer)
 {
     temp_dir  dir;
