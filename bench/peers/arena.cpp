@@ -33,13 +33,6 @@ std::size_t calls_in(double slice, const std::function<void(std::size_t)> & call
 
 } // namespace
 
-double seconds_now(clock_kind kind)
-{
-    timespec now;
-    clock_gettime(kind == clock_kind::wall ? CLOCK_MONOTONIC : CLOCK_THREAD_CPUTIME_ID, &now);
-    return static_cast<double>(now.tv_sec) + static_cast<double>(now.tv_nsec) * 1e-9;
-}
-
 arena::arena(options o, results & figures) : options_(std::move(o)), results_(figures)
 {
     std::filesystem::create_directories(options_.directory);

@@ -7,9 +7,7 @@
 #ifndef PEERS_ARENA_H
 #define PEERS_ARENA_H
 
-#include <chrono>
 #include <cstddef>
-#include <ctime>
 #include <filesystem>
 #include <functional>
 #include <initializer_list>
@@ -20,6 +18,7 @@
 #include <utility>
 #include <vector>
 
+#include "common/clock.h"
 #include "results.h"
 #include "store.h"
 
@@ -39,17 +38,6 @@ struct options {
     // updates take a while.
     std::size_t most_updated = 100'000;
 };
-
-enum class clock_kind { wall, processor };
-
-double seconds_now(clock_kind kind);
-
-template <class Action> double seconds_of(clock_kind kind, Action action)
-{
-    const double start = seconds_now(kind);
-    action();
-    return seconds_now(kind) - start;
-}
 
 // One store that takes part.
 struct contestant {

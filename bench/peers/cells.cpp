@@ -8,12 +8,6 @@
 namespace peers
 {
 
-std::string with_separators(std::size_t number)
-{
-    return number < 1000 ? fmt::format("{}", number)
-                         : fmt::format("{},{:03}", with_separators(number / 1000), number % 1000);
-}
-
 std::optional<double> ratio_of(const results & figures, std::size_t rows, const workload & w, std::string_view store)
 {
     const auto ours   = figures.of(rows, w.name, store_kinds()[0].name);

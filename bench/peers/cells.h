@@ -12,9 +12,6 @@
 namespace peers
 {
 
-// "1,000,000"
-std::string with_separators(std::size_t number);
-
 // How many times as much as this library; for figures of which more is better, how many times less.
 std::optional<double> ratio_of(const results & figures, std::size_t rows, const workload & w, std::string_view store);
 

@@ -7,7 +7,7 @@
 #include <fmt/format.h>
 
 #include "cells.h"
-#include "chart.h"
+#include "common/chart.h"
 #include "workloads.h"
 
 namespace peers

@@ -5,8 +5,8 @@
 
 #include <fmt/format.h>
 
+#include "common/machine.h"
 #include "groups.h"
-#include "machine.h"
 
 namespace peers
 {

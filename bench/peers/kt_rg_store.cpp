@@ -4,17 +4,12 @@
 // A table is keyed by the id or by the name. For the second way to a row there is a second table from name to id, as in
 // the key-value stores; unlike theirs its transaction is one of its own. A read is a call that locks and unlocks the
 // table: there are no reading transactions, so reading alone and together are the same.
-#include <algorithm>
-#include <array>
-#include <bit>
 #include <cstdarg>
 #include <cstdlib>
-#include <utility>
 
 #include <fmt/format.h>
 
-#include "kt_ku.h"
-#include "kt_rg.h"
+#include "common/kt_rg_rows.h"
 #include "store.h"
 
 namespace peers
@@ -23,113 +18,7 @@ namespace peers
 namespace
 {
 
-void check(kt_int32_t code, const char * p_what)
-{
-    if (code == 0)
-        return;
-    ku_error_record_t record;
-    ku_get_error_record_1(&record);
-    throw std::runtime_error(fmt::format("kt_rg: {}: {} {}", p_what, code, record.p_text));
-}
-
-// ---- The hash functions that a caller brings ----
-
-// To the upper bits, for a number of buckets that is a power of two. One function for each, since a function is told
-// the key and nothing else.
-template <int Bits> kt_uint32_t hash_id(void * p_key)
-{
-    std::uint64_t key;
-    std::memcpy(&key, p_key, sizeof key);
-    return static_cast<kt_uint32_t>((key * 0x9e3779b97f4a7c15u) >> (64 - Bits));
-}
-
-template <int Bits> kt_uint32_t hash_name(void * p_key)
-{
-    const std::string_view name = static_cast<const char *>(p_key);
-    return hash_id<Bits>(std::array{digest(name) * 0xff51afd7ed558ccdu}.data());
-}
-
-kt_int32_t compare_ids(void * p_key1, void * p_key2)
-{
-    return std::memcmp(p_key1, p_key2, sizeof(std::uint64_t));
-}
-
-kt_int32_t compare_names(void * p_key1, void * p_key2)
-{
-    return std::strcmp(static_cast<const char *>(p_key1), static_cast<const char *>(p_key2));
-}
-
-constexpr int fewest_bits = 10;
-constexpr int most_bits   = 24;
-
-struct hashing {
-    kt_uint32_t                       buckets;
-    rg_hash_function_t *              p_hash;
-    rg_hash_keys_compare_function_t * p_compare;
-};
-
-template <int... Bits> hashing hashing_of(bool names, int bits, std::integer_sequence<int, Bits...>)
-{
-    constexpr std::array ids_table{&hash_id<fewest_bits + Bits>...};
-    constexpr std::array names_table{&hash_name<fewest_bits + Bits>...};
-    const auto           i = static_cast<std::size_t>(bits - fewest_bits);
-    return {1u << bits, names ? names_table[i] : ids_table[i], names ? compare_names : compare_ids};
-}
-
-// Buckets for so many rows, each with one row or fewer.
-hashing hashing_for(bool names, std::size_t rows)
-{
-    const int bits = std::clamp(static_cast<int>(std::bit_width(rows - 1)), fewest_bits, most_bits);
-    return hashing_of(names, bits, std::make_integer_sequence<int, most_bits - fewest_bits + 1>());
-}
-
-// ---- The tables ----
-
-char Id[]{"id"}, Count[]{"count"}, Ratio[]{"ratio"}, Name[]{"name"}, Note[]{"note"}, Added[]{"added"};
 char Mount_Point[]{"/m"}, Rows_Path[]{"/m/rows"}, Names_Path[]{"/m/names"};
-
-kt_value_t value_of(std::uint64_t id)
-{
-    kt_value_t value;
-    value.val_uint64 = id;
-    return value;
-}
-
-kt_value_t value_of(const name_text & name)
-{
-    kt_value_t value;
-    value.ptr_char = const_cast<char *>(name.text);
-    return value;
-}
-
-rg_column_t column(kt_char_ptr_t p_name, kt_data_type_t type, bool key)
-{
-    return {p_name, type, key ? kt_uint32_t{RG_PRIMARY_KEY} : kt_uint32_t{RG_STANDARD}, 0, nullptr, {}};
-}
-
-constexpr std::size_t columns = 5;
-
-// A row's values as calls take them.
-struct row_values {
-    row_values()
-    {
-        for (std::size_t i = 0; i < columns; ++i)
-            pointers[i] = &values[i];
-    }
-
-    void become(const row & r)
-    {
-        values[0].val_uint64  = r.id;
-        values[1].val_int64   = r.count;
-        values[2].val_float64 = r.ratio;
-        values[3].ptr_char    = const_cast<char *>(r.name.text);
-        values[4].ptr_char    = const_cast<char *>(r.note);
-    }
-
-    kt_char_ptr_t names[columns]{Id, Count, Ratio, Name, Note};
-    kt_value_t    values[columns]{};
-    kt_value_t *  pointers[columns];
-};
 
 class kt_rg_store final : public store
 {

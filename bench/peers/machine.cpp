@@ -1,15 +1,13 @@
 // SPDX-License-Identifier: MIT
 // machine: what the machine itself can do: the limits that no store passes.
-#include "machine.h"
-
-#include <fcntl.h>
 #include <pthread.h>
-#include <sys/uio.h>
-#include <unistd.h>
 
 #include <cstdlib>
 #include <cstring>
 #include <vector>
+
+#include "common/machine.h"
+#include "groups.h"
 
 namespace peers
 {
@@ -17,13 +15,7 @@ namespace peers
 namespace
 {
 
-constexpr ssize_t written = 154; // by an apply of one row: its record and a commit record
-
-// Keeps the compiler from leaving out what nobody looks at.
-template <class T> void use(T & value)
-{
-    asm volatile("" : "+r,m"(value) : : "memory");
-}
+constexpr std::size_t ring_bytes = 256 << 20;
 
 void measure_memcpy(arena & a)
 {
@@ -39,34 +31,13 @@ void measure_memcpy(arena & a)
     a.add("memcpy", machine, 4 * static_cast<double>(bytes) / seconds / 1e9);
 }
 
-// A ring through 2^22 cells, one to a cache line, in an order that no processor foresees: the numbers of a congruential
-// generator that has all of them in its period.
-constexpr std::uint64_t cells  = 1u << 22;
-constexpr std::size_t   stride = 64 / sizeof(std::uint64_t);
-
-std::vector<std::uint64_t> ring()
-{
-    std::vector<std::uint64_t> next(cells * stride);
-    for (std::uint64_t i = 0; i < cells; ++i)
-        next[i * stride] = (i * 6364136223846793005u + 1442695040888963407u) % cells * stride;
-    return next;
-}
-
 void measure_memory_access(arena & a)
 {
     if (!a.wants({"memory_access"}))
         return;
-    const std::vector<std::uint64_t> next = ring();
-    std::uint64_t                    at   = 0;
-    for (int repetition = 0; repetition < a.chosen().repeat; ++repetition) {
-        constexpr int steps   = 200'000;
-        const double  seconds = seconds_of(clock_kind::processor, [&] {
-            for (int i = 0; i < steps; ++i)
-                at = next[at];
-            use(at);
-        });
-        a.add("memory_access", machine, seconds * 1e9 / steps);
-    }
+    memory_ring ring(ring_bytes);
+    for (int repetition = 0; repetition < a.chosen().repeat; ++repetition)
+        a.add("memory_access", machine, ring.nanoseconds_a_step(200'000));
 }
 
 template <class Action> void measure_pairs(arena & a, const char * p_limit, Action pair)
@@ -80,40 +51,6 @@ template <class Action> void measure_pairs(arena & a, const char * p_limit, Acti
 }
 
 } // namespace
-
-fsync_file::fsync_file(const std::string & path)
-    : path_(path), fd_(open(path.c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0644))
-{
-    require(fd_ >= 0, "can't open " + path);
-    append_pair();
-}
-
-fsync_file::~fsync_file()
-{
-    close(fd_);
-    unlink(path_.c_str());
-}
-
-void fsync_file::append_pair()
-{
-    pair(end_, end_);
-    end_ += written;
-}
-
-void fsync_file::overwrite_pair()
-{
-    pair(end_ - written, 0);
-}
-
-void fsync_file::pair(off_t rows_at, off_t mark_at)
-{
-    static char record[130];
-    static char commit[written - sizeof record];
-    const iovec parts[]{{record, sizeof record}, {commit, sizeof commit}};
-    require(lseek(fd_, rows_at, SEEK_SET) == rows_at && writev(fd_, parts, 2) == written && fsync(fd_) == 0 &&
-                lseek(fd_, mark_at, SEEK_SET) == mark_at && write(fd_, commit, 4) == 4 && fsync(fd_) == 0,
-            "can't write " + path_);
-}
 
 void run_machine_limits(arena & a)
 {

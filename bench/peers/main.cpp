@@ -3,16 +3,13 @@
 //
 // docs/PERFORMANCE.md tells what each workload means and how each store is configured. Every answer of every store is
 // checked. Compare stores within one run, by their medians.
-#include <sys/vfs.h>
-
-#include <linux/magic.h>
-
 #include <exception>
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
 #include "charts.h"
+#include "common/machine.h"
 #include "groups.h"
 #include "memory.h"
 #include "report.h"
@@ -29,12 +26,6 @@ struct outputs {
     std::string markdown;
     std::string svg;
 };
-
-bool in_memory(const std::string & directory)
-{
-    struct statfs status;
-    return statfs(directory.c_str(), &status) == 0 && status.f_type == TMPFS_MAGIC;
-}
 
 struct group {
     const char * name;
@@ -62,7 +53,7 @@ void make_directories(const outputs & to)
 void run(const options & o, const outputs & to)
 {
     make_directories(to);
-    if (in_memory(o.directory))
+    if (lies_in_memory(o.directory))
         fmt::print(stderr, "peers: {} has no disk below it: what is durable there costs nothing\n", o.directory);
     results figures;
     arena   a(o, figures);

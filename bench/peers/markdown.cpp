@@ -1,13 +1,9 @@
 // SPDX-License-Identifier: MIT
 // markdown: a run's figures for docs/PERFORMANCE.md.
-#include <sys/utsname.h>
-#include <unistd.h>
-
-#include <fstream>
-
 #include <fmt/os.h>
 
 #include "cells.h"
+#include "common/machine.h"
 #include "report.h"
 #include "store.h"
 #include "workloads.h"
@@ -17,26 +13,6 @@ namespace peers
 
 namespace
 {
-
-std::string processor_name()
-{
-    std::ifstream file("/proc/cpuinfo");
-    for (std::string text; std::getline(file, text);)
-        if (text.starts_with("model name"))
-            return text.substr(text.find(": ") + 2);
-    return "unknown processor";
-}
-
-// What the machine is, without its name.
-std::string machine_text()
-{
-    utsname system;
-    uname(&system);
-    const double memory =
-        static_cast<double>(sysconf(_SC_PHYS_PAGES)) * static_cast<double>(sysconf(_SC_PAGESIZE)) / (1u << 30);
-    return fmt::format("{}, {} processors, {:.0f} GiB of memory, Linux {}", processor_name(),
-                       sysconf(_SC_NPROCESSORS_ONLN), memory, system.release);
-}
 
 // The store with the best figure; smaller is better but for gains.
 std::string_view best_of(const results & figures, std::size_t rows, const workload & w)

@@ -9,17 +9,6 @@
 namespace peers
 {
 
-namespace
-{
-
-double median_of(const std::vector<double> & sorted)
-{
-    const std::size_t middle = sorted.size() / 2;
-    return sorted.size() % 2 == 1 ? sorted[middle] : (sorted[middle - 1] + sorted[middle]) / 2;
-}
-
-} // namespace
-
 void results::add(std::size_t rows, std::string_view workload, std::string_view store, double value)
 {
     samples_[{rows, std::string(workload), std::string(store)}].push_back(value);
@@ -36,9 +25,7 @@ std::optional<summary> results::of(std::size_t rows, std::string_view workload, 
     const auto found = samples_.find({rows, std::string(workload), std::string(store)});
     if (found == samples_.end())
         return std::nullopt;
-    std::vector<double> sorted = found->second;
-    std::sort(sorted.begin(), sorted.end());
-    return summary{median_of(sorted), sorted.front(), sorted.back(), sorted.size()};
+    return summary_of(found->second);
 }
 
 std::vector<std::size_t> results::sizes() const

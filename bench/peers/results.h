@@ -11,18 +11,15 @@
 #include <tuple>
 #include <vector>
 
+#include "common/summary.h"
+
 namespace peers
 {
 
+using namespace bench;
+
 // The name that stands for the machine where a store is named.
 constexpr std::string_view machine = "machine";
-
-struct summary {
-    double      median;
-    double      least;
-    double      most;
-    std::size_t samples;
-};
 
 class results
 {

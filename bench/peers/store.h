@@ -11,13 +11,15 @@
 #include <cstdint>
 #include <memory>
 #include <span>
-#include <stdexcept>
 #include <string>
 
-#include "rows.h"
+#include "common/require.h"
+#include "common/rows.h"
 
 namespace peers
 {
+
+using namespace bench;
 
 // What rows are found by: the key that they lie under, and whether there is a second way to them.
 enum class layout { by_id, by_name, by_id_and_name };
@@ -35,12 +37,6 @@ struct place {
     layout      found_by;
     std::size_t rows; // how many are expected: for what has to be sized ahead
 };
-
-inline void require(bool condition, const std::string & what)
-{
-    if (!condition)
-        throw std::runtime_error(what);
-}
 
 class store
 {

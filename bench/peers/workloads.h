@@ -7,10 +7,12 @@
 #include <string>
 #include <string_view>
 
+#include "common/text.h"
+
 namespace peers
 {
 
-enum class unit { nanoseconds, bytes, times, gigabytes_a_second };
+using namespace bench;
 
 struct workload {
     const char * name;
@@ -23,10 +25,6 @@ struct workload {
 std::span<const workload> workloads();
 // What the machine itself can do; measured in the same run.
 std::span<const workload> machine_limits();
-
-// A figure as a person reads it: "412 ns", "1.80 ms", "93 B".
-enum class digits { three, needed };
-std::string text_of(double value, unit in, digits shown = digits::three);
 
 } // namespace peers
 

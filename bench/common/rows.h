@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: MIT
 // rows: what every store is filled with, in what order it is asked, and what it has to answer.
-#ifndef PEERS_ROWS_H
-#define PEERS_ROWS_H
+#ifndef BENCH_ROWS_H
+#define BENCH_ROWS_H
 
 #include <cstdint>
 #include <cstring>
@@ -10,7 +10,7 @@
 #include <string_view>
 #include <vector>
 
-namespace peers
+namespace bench
 {
 
 constexpr std::size_t name_length = 16;
@@ -140,6 +140,6 @@ class data_set
     std::vector<std::uint64_t> note_sums_;
 };
 
-} // namespace peers
+} // namespace bench
 
 #endif

@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: MIT
-#include "chart.h"
+#include "common/chart.h"
 
 #include <algorithm>
 #include <cmath>
@@ -7,7 +7,7 @@
 
 #include <fmt/os.h>
 
-namespace peers
+namespace bench
 {
 
 namespace
@@ -175,4 +175,4 @@ void write_svg(const chart & c, const std::string & path)
               bottom + 36);
 }
 
-} // namespace peers
+} // namespace bench

@@ -1,12 +1,12 @@
 // SPDX-License-Identifier: MIT
-#include "rows.h"
+#include "common/rows.h"
 
 #include <algorithm>
 #include <cstdio>
 #include <numeric>
 #include <utility>
 
-namespace peers
+namespace bench
 {
 
 namespace
@@ -134,4 +134,4 @@ std::vector<change> data_set::changes(std::int64_t step) const
     return all;
 }
 
-} // namespace peers
+} // namespace bench

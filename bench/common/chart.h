@@ -1,14 +1,14 @@
 // SPDX-License-Identifier: MIT
 // chart: lines over two logarithmic axes, as an SVG file that can be read on light and on dark ground.
-#ifndef PEERS_CHART_H
-#define PEERS_CHART_H
+#ifndef BENCH_CHART_H
+#define BENCH_CHART_H
 
 #include <functional>
 #include <string>
 #include <utility>
 #include <vector>
 
-namespace peers
+namespace bench
 {
 
 struct line {
@@ -30,6 +30,6 @@ struct chart {
 
 void write_svg(const chart & c, const std::string & path);
 
-} // namespace peers
+} // namespace bench
 
 #endif
