@@ -3,7 +3,7 @@
 //
 // The input is the text, a NUL, the row's slots and its indirect data. Each goes into a block of exactly its size, so
 // that the sanitizers see a step outside. Whatever happens must be one of the codes, with a diagnosis exactly if the
-// text was refused, and running twice must give the same answer.
+// text was refused, and running twice, or on the row among others, must give the same answer.
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -57,6 +57,25 @@ kt_int32_t answer(void *, kt_char_t * p_name, kt_uint32_t length, kt_uint32_t, k
     return -1;
 }
 
+// Looks at the row together with another that is it too, between two that aren't asked about.
+bool matches_among_others(void * p_compiled, const char * p_slots, const char * p_indirect, kt_uint32_t indirect_length)
+{
+    constexpr kt_uint32_t   slot_bytes = column_count * 8;
+    std::unique_ptr<char[]> record(new char[sizeof indirect_length + slot_bytes + indirect_length]);
+    char * const            p_row = record.get() + sizeof indirect_length;
+    std::memcpy(record.get(), &indirect_length, sizeof indirect_length);
+    std::memcpy(p_row, p_slots, slot_bytes);
+    if (indirect_length != 0)
+        std::memcpy(p_row + slot_bytes, p_indirect, indirect_length);
+
+    const ku_row_form_t form     = {column_count, 0, slot_bytes, -static_cast<kt_int32_t>(sizeof indirect_length), 0};
+    const void * const  rows[]   = {nullptr, p_row, nullptr, p_row};
+    kt_uint64_t         matching = 0;
+    if (ku_exec_expr_on_rows_1(p_compiled, 16, &form, rows, 10, &matching) != 0 || (matching != 0 && matching != 10))
+        std::abort();
+    return matching != 0;
+}
+
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t * p_data, size_t size)
@@ -95,6 +114,9 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t * p_data, size_t size)
     const kt_int32_t first_rc = run(&first), second_rc = run(&second);
     if (first_rc != second_rc || first != second || (first_rc == 0) != (first < 2) ||
         (first_rc != 0 && (first_rc < KU_EXPR_E_INTEGER_FAULT || first_rc > KU_EXPR_E_DAMAGED_VALUE)))
+        std::abort();
+    if (matches_among_others(p_compiled, slots.get(), indirect.get(), static_cast<kt_uint32_t>(indirect_length)) !=
+        (first == 1))
         std::abort();
     ku_free_expr_1(p_compiled, 0);
     return 0;

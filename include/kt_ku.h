@@ -199,8 +199,8 @@ typedef kt_int32_t ku_validate_callback_t(void * token, kt_char_t * p_name, kt_u
  *   p_p_compiled    receives the compiled expression, which goes back through ku_free_expr_1; untouched after a failure
  *
  * Returns 0, KU_EXPR_E_SYNTAX (also for a NULL argument), KU_EXPR_E_NO_SUCH_NAME, KU_EXPR_E_TYPES, KU_EXPR_E_TOO_LONG
- * or KU_EXPR_E_NO_MEMORY. ku_expr_diagnosis_1 tells where and why. Time and memory are in proportion to the text. Sets
- * no error record. */
+ * or KU_EXPR_E_NO_MEMORY. ku_expr_diagnosis_1 tells where and why. Time and memory are in proportion to the text, but
+ * that the elements of lists are sorted. Sets no error record. */
 kt_int32_t ku_comp_expr_1(kt_char_ptr_t p_text, kt_uint32_t flags, ku_validate_callback_t callback, void * token,
                           void ** p_p_compiled);
 
@@ -226,6 +226,29 @@ kt_int32_t ku_exec_expr_1(void * p_compiled, kt_uint32_t flags, const void * p_v
  * there is KU_EXPR_E_DAMAGED_VALUE. */
 kt_int32_t ku_exec_expr_within_1(void * p_compiled, kt_uint32_t flags, const void * p_values, kt_uint32_t total_values,
                                  kt_uint32_t * p_result, const void * p_indirect_data, kt_uint32_t indirect_length);
+
+/* How the rows lie that ku_exec_expr_on_rows_1 is given: each around an address of its own, and all alike. Offsets are
+ * bytes from that address. */
+typedef struct ku_row_form_t {
+    kt_uint32_t total_values;    /* slots of a row */
+    kt_int32_t  values_offset;   /* of the first slot */
+    kt_int32_t  indirect_offset; /* of the place where the offsets of indirect values count from */
+    kt_int32_t  length_offset; /* of a word of 4 bytes, at any alignment, that tells how much indirect data there is: */
+    kt_uint32_t length_excess; /* the bytes of it, and so many more; a word below that stands for none */
+} ku_row_form_t;
+
+/* Runs a compiled expression on up to 64 rows.
+ *
+ *   p_compiled   from ku_comp_expr_1; several threads may run it at once
+ *   flags        16; not looked at
+ *   p_form       how the rows lie
+ *   p_p_rows     the rows' addresses
+ *   rows         which of them to look at: bit i stands for p_p_rows[i]. An address without its bit isn't looked at
+ *   p_matching   receives the rows on which ku_exec_expr_within_1 would give 0 and the truth 1, in the same form
+ *
+ * Returns 0, or KU_EXPR_E_SYNTAX if a pointer is NULL. Allocates nothing, sets no error record. */
+kt_int32_t ku_exec_expr_on_rows_1(void * p_compiled, kt_uint32_t flags, const ku_row_form_t * p_form,
+                                  const void * const * p_p_rows, kt_uint64_t rows, kt_uint64_t * p_matching);
 
 /* Releases a compiled expression that nobody is running any more; NULL is passed over. flags: 0; not looked at. */
 void ku_free_expr_1(void * p_compiled, kt_uint32_t flags);

@@ -16,10 +16,8 @@ namespace
 
 constexpr char module_version[] = "rg_i_criteria 1.0";
 
-constexpr kt_uint32_t no_parent             = 0xFFFFFFFF;
-constexpr kt_int32_t  no_such               = -1;
-constexpr kt_int32_t  first_harmless_result = KU_EXPR_E_INTEGER_FAULT;
-constexpr kt_int32_t  last_harmless_result  = KU_EXPR_E_DAMAGED_VALUE;
+constexpr kt_uint32_t no_parent = 0xFFFFFFFF;
+constexpr kt_int32_t  no_such   = -1;
 
 // A field of a packed structured data definition: a count, and then for each field its type and its name.
 [[nodiscard]] kt_int32_t find_field(const void * p_definition, const kt_char_t * p_name,
@@ -79,17 +77,20 @@ kt_int32_t rg_i_compile_expression(kt_char_ptr_t p_selection_criteria, rg_i_tabl
 
 kt_int32_t rg_i_criteria::compile(kt_char_ptr_t p_selection_criteria, rg_i_table_t * p_table)
 {
-    total_columns_ = p_table->total_columns;
-    fixed_length_  = rg_i_row_fixed_length(total_columns_);
+    // A record is 20 bytes of head, which begin with the length of all of it, and then its data: four bytes, the slots,
+    // and what the slots lead to.
+    const kt_uint32_t fixed_length = rg_i_row_fixed_length(p_table->total_columns);
+    constexpr auto    head_length  = static_cast<kt_int32_t>(RG_I_RECORD_HEAD_LENGTH);
+
+    form_ = {p_table->total_columns, sizeof(kt_uint32_t), static_cast<kt_int32_t>(fixed_length), -head_length,
+             RG_I_RECORD_HEAD_LENGTH + fixed_length};
     if (p_selection_criteria == nullptr)
         return 0;
     ku_iconv_t * p_handle = p_table->p_tree != nullptr ? p_table->p_tree->p_to_table_string_conversion_handle : nullptr;
     return rg_i_compile_expression(p_selection_criteria, p_table, &p_compiled_, p_handle);
 }
 
-kt_int32_t rg_i_criteria::settle(kt_int32_t result)
+kt_int32_t rg_i_criteria::fail(kt_int32_t result)
 {
-    if (result >= first_harmless_result && result <= last_harmless_result)
-        return 0;
     return rg_i_fail_library_call(RG_HERE, "ku_exec_expr", result);
 }

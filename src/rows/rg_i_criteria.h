@@ -1,11 +1,12 @@
 // SPDX-License-Identifier: MIT
 // rg_i_criteria: selection criteria: from a caller's format and values to text, from text to a compiled expression, and
-// the question whether a row matches it.
+// the walk over the rows that match it.
 #pragma once
 
 #include <cstdarg>
 
 #include "frame/rg_i_guards.h"
+#include "rg_i_row_walk.h"
 #include "rg_i_table.h"
 
 // Renders the format with the values of ap. *result comes back with the text, which the caller frees, also after a
@@ -39,31 +40,37 @@ class rg_i_criteria
     // With the handle of the table's tree, or none for a table without one.
     [[nodiscard]] kt_int32_t compile(kt_char_ptr_t p_selection_criteria, rg_i_table_t * p_table);
 
-    // A row whose evaluation faults doesn't match. A NULL record is one that nothing can be asked of.
-    [[nodiscard]] kt_int32_t look_at(const kt_char_t * p_record, bool * p_matches) const
+    // Which rows of the group match. One whose evaluation faults doesn't, nor does one without a record to judge it by.
+    [[nodiscard]] kt_int32_t look_at(const rg_i_row_group_t & group, kt_uint64_t * p_matching) const
     {
-        *p_matches = true;
+        *p_matching = group.rows;
         if (p_compiled_ == nullptr)
             return 0;
-        *p_matches = false;
-        if (p_record == nullptr)
-            return 0;
-        kt_uint32_t      row_matches = 0;
-        const kt_int32_t result = ku_exec_expr_within_1(p_compiled_, evaluation_flags, p_record + sizeof(kt_uint32_t),
-                                                        total_columns_, &row_matches, p_record + fixed_length_,
-                                                        rg_i_record_data_length(p_record) - fixed_length_);
-        if (result != 0)
-            return settle(result);
-        *p_matches = row_matches != 0;
-        return 0;
+        const kt_int32_t result =
+            ku_exec_expr_on_rows_1(p_compiled_, evaluation_flags, &form_,
+                                   reinterpret_cast<const void * const *>(group.records), group.judged, p_matching);
+        return result == 0 ? 0 : fail(result);
     }
 
   private:
     static constexpr kt_uint32_t evaluation_flags = 16;
 
-    [[nodiscard]] static kt_int32_t settle(kt_int32_t result);
+    [[nodiscard]] static kt_int32_t fail(kt_int32_t result);
 
-    void *      p_compiled_    = nullptr;
-    kt_uint32_t total_columns_ = 0;
-    kt_uint32_t fixed_length_  = 0;
+    void *        p_compiled_ = nullptr;
+    ku_row_form_t form_       = {};
 };
+
+// Visits each row that has a record in the role, and of which the criteria are true when it is judged by its record in
+// the other role, with its slot and that record.
+template <class Visit>
+[[nodiscard]] kt_int32_t rg_i_walk_matching_rows(const rg_i_table_t * p_table, row_role role, row_role judged_role,
+                                                 const rg_i_criteria & criteria, Visit && visit)
+{
+    return rg_i_walk_row_groups(p_table, role, judged_role, [&](const rg_i_row_group_t & group) -> kt_int32_t {
+        kt_uint64_t matching = 0;
+        if (const kt_int32_t rc = criteria.look_at(group, &matching); rc != 0)
+            return rc;
+        return rg_i_visit_rows(group, matching, visit);
+    });
+}

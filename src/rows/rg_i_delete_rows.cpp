@@ -63,10 +63,7 @@ kt_int32_t rg_i_delete_rows(rg_i_table_t * p_table, kt_char_ptr_t p_selection_cr
     rg_i_criteria criteria;
     if (const kt_int32_t rc = criteria.compile(p_selection_criteria, p_table); rc != 0)
         return rc;
-    return rg_i_walk_rows(p_table, row_role::applied, [&](kt_uint32_t slot, kt_char_ptr_t p_record) -> kt_int32_t {
-        bool matches = false;
-        if (const kt_int32_t rc = criteria.look_at(p_record, &matches); rc != 0)
-            return rc;
-        return matches ? rg_i_delete_row(p_table, &p_table->p_rows_fixed_index[slot]) : 0;
-    });
+    return rg_i_walk_matching_rows(
+        p_table, row_role::applied, row_role::applied, criteria,
+        [&](kt_uint32_t slot, kt_char_ptr_t) { return rg_i_delete_row(p_table, &p_table->p_rows_fixed_index[slot]); });
 }

@@ -115,15 +115,11 @@ kt_int32_t rg_i_get_selected_rows(rg_i_table_t * p_table, kt_char_ptr_t p_select
     // applied record. A row whose deletion is pending has none, and matches no criteria.
     kt_uint32_t *    p_rows = list.rows.get();
     kt_uint32_t      total  = 0;
-    const kt_int32_t rc     = rg_i_walk_rows(p_table, role, [&](kt_uint32_t slot, kt_char_ptr_t) -> kt_int32_t {
-        bool matches = false;
-        if (const kt_int32_t look_rc = criteria.look_at(p_table->p_rows_fixed_index[slot].p_applied, &matches);
-            look_rc != 0)
-            return look_rc;
-        p_rows[total] = slot;
-        total += matches ? 1 : 0;
-        return 0;
-    });
+    const kt_int32_t rc =
+        rg_i_walk_matching_rows(p_table, role, row_role::applied, criteria, [&](kt_uint32_t slot, kt_char_ptr_t) {
+            p_rows[total++] = slot;
+            return 0;
+        });
     if (rc != 0)
         return rc;
     *p_total_selected_rows         = total;

@@ -134,11 +134,8 @@ constexpr kt_uint32_t result_mode = RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL;
         return rc;
     // Kept because callers depend on it: there is no argument of visibility, the source's own field alone counts.
     const row_role role = rg_i_visible_role(p_table->uncommitted_updates_visible);
-    return rg_i_walk_rows(p_table, role, [&](kt_uint32_t, kt_char_ptr_t p_record) -> kt_int32_t {
-        bool matches = false;
-        if (const kt_int32_t rc = criteria.look_at(p_record, &matches); rc != 0)
-            return rc;
-        return matches ? rg_i_copy_row(p_table, p_record, p_new_table, p_column_indices) : 0;
+    return rg_i_walk_matching_rows(p_table, role, role, criteria, [&](kt_uint32_t, kt_char_ptr_t p_record) {
+        return rg_i_copy_row(p_table, p_record, p_new_table, p_column_indices);
     });
 }
 

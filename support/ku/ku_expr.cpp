@@ -3,6 +3,7 @@
 //
 // Locking: none. A diagnosis belongs to the thread that got it; a compiled expression is read-only.
 #include "ku_expr.h"
+#include "ku_expr_tests.h"
 #include "ku_thread_buffer.h"
 
 #include <cstdio>
@@ -95,8 +96,20 @@ extern "C" kt_int32_t ku_exec_expr_within_1(void * p_compiled, kt_uint32_t, cons
         return KU_EXPR_E_NO_SUCH_ELEMENT;
     if (p_indirect_data == nullptr)
         indirect_length = 0;
-    return ku_expr_run(*p_program, static_cast<const uint8_t *>(p_values), p_result,
-                       static_cast<const uint8_t *>(p_indirect_data), indirect_length);
+    const ku_row_t row = {static_cast<const uint8_t *>(p_values),
+                          {static_cast<const uint8_t *>(p_indirect_data), indirect_length}};
+    return ku_expr_run(*p_program, p_program->instructions(), row, p_result);
+}
+
+extern "C" kt_int32_t ku_exec_expr_on_rows_1(void * p_compiled, kt_uint32_t, const ku_row_form_t * p_form,
+                                             const void * const * p_p_rows, kt_uint64_t rows, kt_uint64_t * p_matching)
+{
+    const auto * p_program = static_cast<const ku_program_t *>(p_compiled);
+    if (p_program == nullptr || p_form == nullptr || p_p_rows == nullptr || p_matching == nullptr)
+        return KU_EXPR_E_SYNTAX;
+    const bool has_all_columns = p_program->columns_needed <= p_form->total_values;
+    *p_matching                = has_all_columns ? ku_expr_run_on_rows(*p_program, *p_form, p_p_rows, rows) : 0;
+    return 0;
 }
 
 extern "C" kt_int32_t ku_exec_expr_1(void * p_compiled, kt_uint32_t flags, const void * p_values,

@@ -170,12 +170,20 @@ enum ku_operation_t : uint8_t {
     KU_OP_UINT32_IN_RANGE,
     KU_OP_INT64_IN_RANGE,
     KU_OP_UINT64_IN_RANGE,
-    KU_OP_FLOAT32_IS, // `detail`: the relation
-    KU_OP_FLOAT64_IS, // `detail`: the relation
-    KU_OP_STRING_IS,  // `detail`: the relation
+    KU_OP_FLOAT32_IS, // `detail`: the relation, one that NaN doesn't satisfy
+    KU_OP_FLOAT64_IS, // the same
+    KU_OP_INT32_IN_SET,
+    KU_OP_UINT32_IN_SET,
+    KU_OP_INT64_IN_SET,
+    KU_OP_UINT64_IN_SET,
+    KU_OP_FLOAT32_IN_SET,
+    KU_OP_FLOAT64_IN_SET,
+    KU_OP_STRING_IS, // `detail`: the relation
+    KU_OP_STRING_IN_SET,
     KU_OP_STRING_STARTS_WITH,
     KU_OP_STRING_ENDS_WITH,
     KU_OP_STRING_CONTAINS,
+    KU_OP_LAST_COLUMN_TEST = KU_OP_STRING_CONTAINS,
 
     // Tests of values on the stack. `detail`: the relation of a comparison.
     KU_OP_COMPARE_INTEGERS,
@@ -196,6 +204,11 @@ enum ku_operation_t : uint8_t {
 inline bool ku_operation_is_test(uint8_t operation)
 {
     return operation >= KU_OP_FIRST_TEST && operation <= KU_OP_LAST_TEST;
+}
+
+inline bool ku_operation_is_column_test(uint8_t operation)
+{
+    return operation >= KU_OP_FIRST_TEST && operation <= KU_OP_LAST_COLUMN_TEST;
 }
 
 // What a test does with its truth value: pushes it, or, if it decides a chain of && or ||, pushes it and jumps, and
@@ -237,6 +250,14 @@ union ku_constant_t {
         kt_uint32_t offset; // in the program's texts
         kt_uint32_t length;
     } text;
+    struct {
+        kt_uint32_t members; // the next so many constants
+    } set;
+    struct {
+        uint64_t    key;
+        kt_uint32_t offset; // of a string, in the program's texts
+        kt_uint32_t length;
+    } member; // of a set: see ku_expr_sets.h
 };
 static_assert(sizeof(ku_constant_t) == 16);
 
@@ -262,9 +283,15 @@ static_assert(sizeof(ku_program_t) == 16 && std::is_trivially_copyable_v<ku_prog
 [[nodiscard]] kt_int32_t ku_expr_compile(const char * p_text, const char * p_end, ku_validate_callback_t * p_callback,
                                          void * p_token, ku_program_t ** p_p_program, ku_expr_trouble_t * p_trouble);
 
-// Runs the program on a row whose slots begin at p_values and whose indirect data has indirect_length bytes.
-[[nodiscard]] kt_int32_t ku_expr_run(const ku_program_t & program, const uint8_t * p_values, kt_uint32_t * p_result,
-                                     const uint8_t * p_indirect_data, kt_uint32_t indirect_length);
+struct ku_row_t;
+
+// Runs the program on a row from an instruction on, ahead of which nothing is left on the stack.
+[[nodiscard]] kt_int32_t ku_expr_run(const ku_program_t & program, const ku_instruction_t * p_first,
+                                     const ku_row_t & row, kt_uint32_t * p_result);
+
+// Which of the rows the program is true of. Bit i of the sets stands for p_p_rows[i].
+[[nodiscard]] uint64_t ku_expr_run_on_rows(const ku_program_t & program, const ku_row_form_t & form,
+                                           const void * const * p_p_rows, uint64_t rows);
 
 // ---- Patterns ----
 

@@ -1,7 +1,9 @@
 // SPDX-License-Identifier: MIT
 // ku_expr_code: builds the program; see ku_expr_code.h.
 #include "ku_expr_code.h"
+#include "ku_expr_sets.h"
 
+#include <algorithm>
 #include <cassert>
 #include <cstdlib>
 #include <cstring>
@@ -53,7 +55,7 @@ void ku_expr_code::truncate(kt_uint32_t start, kt_uint32_t values)
     for (kt_uint32_t i = start; i < position(); i++) {
         const uint8_t operation = code_[i].operation;
         if (operation == KU_OP_INTEGER || operation == KU_OP_FLOATING || operation == KU_OP_TEXT ||
-            operation == KU_OP_LIST_CONSTANT || (operation >= KU_OP_FIRST_TEST && operation <= KU_OP_STRING_CONTAINS)) {
+            operation == KU_OP_LIST_CONSTANT || ku_operation_is_column_test(operation)) {
             constants_.truncate(code_[i].constant); // constants stand in the order of their instructions
             break;
         }
@@ -335,6 +337,23 @@ constexpr int_column int_columns[] = {{KT_INT32, KU_OP_INT32_IN_RANGE, INT32_MIN
                                       {KT_INT64, KU_OP_INT64_IN_RANGE, INT64_MIN, INT64_MAX},
                                       {KT_UINT64, KU_OP_UINT64_IN_RANGE, 0, UINT64_MAX}};
 
+// The column's own value that equals a number, if it has one.
+bool integer_of_column(const int_column & column, const int_range & equal, uint64_t * p_key)
+{
+    if (equal.first > equal.last || equal.first < column.lowest || equal.first > column.highest)
+        return false;
+    *p_key = ku_set_key(equal.first);
+    return true;
+}
+
+bool floating_of_column(double value, uint64_t * p_key)
+{
+    if (std::isnan(value))
+        return false;
+    *p_key = ku_set_key(value);
+    return true;
+}
+
 } // namespace
 
 // Relations but KU_NE become a range of the column's own values, and that one the opposite of a range.
@@ -367,10 +386,13 @@ void ku_expr_code::test_integer_column(const ku_instruction_t & column, uint8_t 
 }
 
 // An integer that no floating-point number equals is replaced by its neighbour, and the relation by the one that leads
-// to the same.
+// to the same. KU_NE becomes the opposite of a relation too: NaN satisfies none that is tested.
 void ku_expr_code::test_floating_column(const ku_instruction_t & column, uint8_t relation,
                                         const ku_instruction_t & constant)
 {
+    const bool negated = relation == KU_NE;
+    if (negated)
+        relation = KU_EQ;
     ku_constant_t limit = {};
     if (constant.operation == KU_OP_FLOATING) {
         limit.floating = constants_[constant.constant].floating;
@@ -382,15 +404,17 @@ void ku_expr_code::test_floating_column(const ku_instruction_t & column, uint8_t
             relation ^= KU_EQUAL; // column <= integer is column < limit
         if (order == KU_GREATER && (relation == KU_LT || relation == KU_GE))
             relation ^= KU_EQUAL; // column < integer is column <= limit
-        if (order != KU_EQUAL && (relation == KU_EQ || relation == KU_NE)) {
+        if (order != KU_EQUAL && relation == KU_EQ) {
             truncate(position() - 2, 2);
-            return emit_truth(relation == KU_NE);
+            return emit_truth(negated);
         }
     }
     const ku_operation_t test = column.detail == KT_FLOAT32 ? KU_OP_FLOAT32_IS : KU_OP_FLOAT64_IS;
     const kt_uint32_t    id   = column.operand;
     truncate(position() - 2, 2);
     emit_column_test(test, relation, id, limit);
+    if (!failed_)
+        code_[position() - 1].negated = negated ? 1 : 0;
 }
 
 // The column and the constant are the last two instructions, in either order.
@@ -583,13 +607,118 @@ void ku_expr_code::list_element(ku_expr_kind_t value_kind, const ku_operand_t & 
     link_jump(position() - 1, p_chain);
 }
 
-void ku_expr_code::list_end(bool negated, kt_uint32_t chain)
+void ku_expr_code::list_end(const ku_operand_t & value, bool negated, kt_uint32_t chain)
 {
+    if (fuse_list(value, negated))
+        return;
     emit(KU_OP_LIST_END, 0, 0, 0);
     if (failed_)
         return;
     code_[position() - 1].negated = negated ? 1 : 0;
     end_chain(chain);
+}
+
+bool ku_expr_code::is_list_of_constants(const ku_operand_t & value) const
+{
+    if (failed_ || value.start < barrier_ || code_[value.start].operation != KU_OP_COLUMN)
+        return false;
+    const ku_instruction_t * const p_end = code_.data() + position();
+    return std::all_of(code_.data() + value.start + 1, p_end,
+                       [](const ku_instruction_t & i) { return i.operation == KU_OP_LIST_CONSTANT; });
+}
+
+// False: no value of the column equals the element.
+bool ku_expr_code::member_of_list(kt_data_type_t column_type, const ku_instruction_t & element,
+                                  ku_constant_t * p_member) const
+{
+    const ku_constant_t value = constants_[element.constant];
+    *p_member                 = {};
+    uint64_t * const p_key    = &p_member->member.key;
+    switch (element.detail) {
+    case KU_PAIR_INTEGERS:
+        return integer_of_column(int_columns[column_type - KT_INT32], range_of(KU_EQ, value.integer), p_key);
+    case KU_PAIR_INTEGER_WITH_FLOATING:
+        return integer_of_column(int_columns[column_type - KT_INT32], range_of(KU_EQ, value.floating), p_key);
+    case KU_PAIR_FLOATING_WITH_INTEGER: {
+        const double nearest = static_cast<double>(value.integer);
+        return ku_compare_int_with_float(value.integer, nearest) == KU_EQUAL && floating_of_column(nearest, p_key);
+    }
+    case KU_PAIR_FLOATINGS:
+        return floating_of_column(value.floating, p_key);
+    default:
+        p_member->member = {ku_set_key(texts_.data() + value.text.offset, value.text.length), value.text.offset,
+                            value.text.length};
+        return true;
+    }
+}
+
+namespace
+{
+
+ku_operation_t set_test_of(kt_data_type_t column_type)
+{
+    switch (column_type) {
+    case KT_INT32:
+        return KU_OP_INT32_IN_SET;
+    case KT_UINT32:
+        return KU_OP_UINT32_IN_SET;
+    case KT_INT64:
+        return KU_OP_INT64_IN_SET;
+    case KT_UINT64:
+        return KU_OP_UINT64_IN_SET;
+    case KT_FLOAT32:
+        return KU_OP_FLOAT32_IN_SET;
+    case KT_FLOAT64:
+        return KU_OP_FLOAT64_IN_SET;
+    case KT_CHAR_PTR:
+        return KU_OP_STRING_IN_SET;
+    default:
+        return KU_OP_END; // none
+    }
+}
+
+} // namespace
+
+// A column in a list of nothing but constants becomes one test. The members take the place of the elements' constants.
+bool ku_expr_code::fuse_list(const ku_operand_t & value, bool negated)
+{
+    if (!is_list_of_constants(value))
+        return false;
+    const ku_instruction_t column = code_[value.start];
+    const ku_operation_t   test   = set_test_of(column.detail);
+    if (test == KU_OP_END)
+        return false;
+    const kt_uint32_t set   = code_[value.start + 1].constant;
+    kt_uint32_t       total = 0;
+    for (kt_uint32_t i = value.start + 1; i < position(); i++) {
+        ku_constant_t member;
+        if (member_of_list(column.detail, code_[i], &member))
+            constants_[set + total++] = member;
+    }
+    code_.truncate(value.start);
+    constants_.truncate(set + total);
+    depth_--;
+    if (total == 0) { // of numbers, which are whatever their slot holds: nothing can be damaged
+        emit_truth(negated);
+        return true;
+    }
+    // The first member makes room for the number of them.
+    const ku_constant_t first = constants_[set];
+    if (!constants_.push(first)) {
+        failed_ = true;
+        return true;
+    }
+    ku_constant_t * const p_set = constants_.data() + set;
+    *p_set                      = {};
+    p_set->set.members          = total;
+    std::sort(p_set + 1, p_set + 1 + total,
+              [](const ku_constant_t & l, const ku_constant_t & r) { return l.member.key < r.member.key; });
+    emit(test, 0, column.operand, +1);
+    if (failed_)
+        return true;
+    code_[position() - 1].constant = set;
+    code_[position() - 1].negated  = negated ? 1 : 0;
+    return true;
 }
 
 int ku_expr_code::constant_truth(const ku_operand_t & operand) const

@@ -2,7 +2,7 @@
 // ku_expr_code: the program under construction. Internal to the selection language.
 //
 // The parser calls these functions in the order of the text, operands before their operator, with types that fit. What
-// can be computed now is folded into a constant, and a comparison of a column with a constant becomes one instruction.
+// can be computed now is folded into a constant, and a comparison of a column with constants becomes one instruction.
 // Always holds: instructions below the barrier are the target of a jump or lie before one, and are not changed any
 // more. Failure: only for want of memory. It sticks: later calls do nothing, and finish() reports it.
 #pragma once
@@ -55,7 +55,7 @@ class ku_expr_code
 
     // ---- Lists: the value, and then for each element its instructions and list_element() ----
     void list_element(ku_expr_kind_t value_kind, const ku_operand_t & element, bool negated, kt_uint32_t * p_chain);
-    void list_end(bool negated, kt_uint32_t chain);
+    void list_end(const ku_operand_t & value, bool negated, kt_uint32_t chain);
 
     // ---- Chains of && or || ----
     // What the operand is worth, if that is known now: 0, 1, or -1 if it isn't.
@@ -99,6 +99,9 @@ class ku_expr_code
     void test_column(const ku_instruction_t & column, uint8_t relation, const ku_instruction_t & constant);
     void test_integer_column(const ku_instruction_t & column, uint8_t relation, const ku_instruction_t & constant);
     void test_floating_column(const ku_instruction_t & column, uint8_t relation, const ku_instruction_t & constant);
+    bool fuse_list(const ku_operand_t & value, bool negated);
+    bool is_list_of_constants(const ku_operand_t & value) const;
+    bool member_of_list(kt_data_type_t column_type, const ku_instruction_t & element, ku_constant_t * p_member) const;
     const ku_constant_t & constant_of(kt_uint32_t instruction) const { return constants_[code_[instruction].constant]; }
 
     ku_growable<ku_instruction_t> code_;

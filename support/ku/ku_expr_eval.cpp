@@ -7,6 +7,7 @@
 // Failure: the first fault ends the run with its code.
 #include "ku_expr.h"
 #include "ku_expr_stored.h"
+#include "ku_expr_tests.h"
 #include "ku_regex.h"
 
 #include <algorithm>
@@ -22,20 +23,6 @@ constexpr kt_uint32_t usual_stack = 32;
 ku_text_t text_of(const ku_value_t & value)
 {
     return {value.bytes.p, value.bytes.length, static_cast<uint8_t>(value.bytes.letters)};
-}
-
-uint8_t order_of(int comparison)
-{
-    return comparison == 0 ? KU_EQUAL : comparison < 0 ? KU_LESS : KU_GREATER;
-}
-
-uint8_t compare_bytes(const uint8_t * p_left, size_t left_length, const uint8_t * p_right, size_t right_length)
-{
-    const size_t common     = std::min(left_length, right_length);
-    const int    comparison = common != 0 ? std::memcmp(p_left, p_right, common) : 0;
-    if (comparison != 0 || left_length == right_length)
-        return order_of(comparison);
-    return left_length < right_length ? KU_LESS : KU_GREATER;
 }
 
 uint8_t compare_shown(const ku_text_t & left, const ku_text_t & right)
@@ -56,7 +43,7 @@ uint8_t compare_shown(const ku_text_t & left, const ku_text_t & right)
 uint8_t compare_strings(const ku_value_t & left, const ku_value_t & right)
 {
     if (left.bytes.letters == KU_LETTERS_AS_THEY_ARE && right.bytes.letters == KU_LETTERS_AS_THEY_ARE)
-        return compare_bytes(left.bytes.p, left.bytes.length, right.bytes.p, right.bytes.length);
+        return ku_compare_bytes(left.bytes.p, left.bytes.length, right.bytes.p, right.bytes.length);
     return compare_shown(text_of(left), text_of(right));
 }
 
@@ -64,20 +51,6 @@ bool bytes_are_equal(const ku_value_t & left, const ku_value_t & right)
 {
     return left.bytes.length == right.bytes.length &&
            (left.bytes.length == 0 || std::memcmp(left.bytes.p, right.bytes.p, left.bytes.length) == 0);
-}
-
-// Short runs of bytes without a call: the length is the same for every row.
-bool begin_equally(const uint8_t * p, const uint8_t * q, size_t length)
-{
-    if (length > 8)
-        return std::memcmp(p, q, length) == 0;
-    if (length >= 4)
-        return ku_load<uint32_t>(p) == ku_load<uint32_t>(q) &&
-               ku_load<uint32_t>(p + length - 4) == ku_load<uint32_t>(q + length - 4);
-    if (length >= 2)
-        return ku_load<uint16_t>(p) == ku_load<uint16_t>(q) &&
-               ku_load<uint16_t>(p + length - 2) == ku_load<uint16_t>(q + length - 2);
-    return length == 0 || *p == *q;
 }
 
 // ---- Equality by pair of types ----
@@ -152,63 +125,17 @@ bool equals_constant(uint8_t pair, const ku_value_t & left, const ku_constant_t 
     return ku_read_value(instruction.detail, p_slot, item, p_value) ? 0 : KU_EXPR_E_DAMAGED_VALUE;
 }
 
-// ---- Tests of a column that is a string ----
-
-// What a string column is compared with, and its item. False: the item isn't well formed.
-struct column_string {
-    ku_extent_t     item;
-    const uint8_t * p_literal;
-    kt_uint32_t     literal_length;
-};
-
-bool starts_with(const column_string & c)
-{
-    return c.item.length > c.literal_length && begin_equally(c.item.p, c.p_literal, c.literal_length);
-}
-
-bool test_string(const ku_instruction_t & instruction, const column_string & c)
-{
-    if (instruction.operation == KU_OP_STRING_STARTS_WITH)
-        return starts_with(c);
-    // The literal has no terminator in it, so this tells an equal string without measuring it.
-    if (instruction.operation == KU_OP_STRING_IS && instruction.detail == KU_EQ)
-        return starts_with(c) && c.item.p[c.literal_length] == '\0';
-    const kt_uint32_t length = ku_string_length(c.item);
-    switch (instruction.operation) {
-    case KU_OP_STRING_ENDS_WITH:
-        return length >= c.literal_length &&
-               begin_equally(c.item.p + length - c.literal_length, c.p_literal, c.literal_length);
-    case KU_OP_STRING_CONTAINS:
-        return memmem(c.item.p, length, c.p_literal, c.literal_length) != nullptr;
-    default:
-        return (compare_bytes(c.item.p, length, c.p_literal, c.literal_length) & instruction.detail) != 0;
-    }
-}
-
 // ---- The machine ----
 
-struct row {
-    const uint8_t * p_values;
-    ku_extent_t     indirect;
-};
-
 template <kt_uint32_t Room>
-[[nodiscard]] kt_int32_t run(const ku_program_t & program, const row & the_row, kt_uint32_t * p_result)
+[[nodiscard]] kt_int32_t run(const ku_program_t & program, const ku_instruction_t * p, const ku_row_t & row,
+                             kt_uint32_t * p_result)
 {
     const ku_constant_t * const    p_constants    = program.constants();
     const ku_instruction_t * const p_instructions = program.instructions();
-    const ku_instruction_t *       p              = p_instructions;
     ku_value_t                     stack[Room + 1]; // the lowest value stands at 1
     size_t                         top   = 0;
     bool                           truth = false;
-
-    const auto slot = [&the_row](const ku_instruction_t & i) {
-        return the_row.p_values + static_cast<size_t>(i.operand) * ku_slot_size;
-    };
-    const auto in_range = [&](uint64_t bits) {
-        const auto & range = p_constants[p->constant].range;
-        return bits - range.low <= range.span;
-    };
 
     for (;; p++) {
         switch (p->operation) {
@@ -228,7 +155,7 @@ template <kt_uint32_t Room>
             continue;
         }
         case KU_OP_COLUMN:
-            if (!ku_read_value(p->detail, slot(*p), the_row.indirect, &stack[++top]))
+            if (!ku_read_value(p->detail, ku_slot(row, *p), row.indirect, &stack[++top]))
                 return KU_EXPR_E_DAMAGED_VALUE;
             continue;
         case KU_OP_FIELD:
@@ -316,36 +243,16 @@ template <kt_uint32_t Room>
             stack[top].integer = p->negated;
             continue;
 
-        case KU_OP_INT32_IN_RANGE:
-            truth = in_range(static_cast<uint64_t>(static_cast<int64_t>(ku_load<kt_int32_t>(slot(*p)))));
-            break;
-        case KU_OP_UINT32_IN_RANGE:
-            truth = in_range(ku_load<kt_uint32_t>(slot(*p)));
-            break;
-        case KU_OP_INT64_IN_RANGE:
-        case KU_OP_UINT64_IN_RANGE:
-            truth = in_range(ku_load<kt_uint64_t>(slot(*p)));
-            break;
-        case KU_OP_FLOAT32_IS:
-            truth = (ku_compare_floats(static_cast<double>(ku_load<kt_float32_t>(slot(*p))),
-                                       p_constants[p->constant].floating) &
-                     p->detail) != 0;
-            break;
-        case KU_OP_FLOAT64_IS:
-            truth = (ku_compare_floats(ku_load<kt_float64_t>(slot(*p)), p_constants[p->constant].floating) &
-                     p->detail) != 0;
-            break;
-        case KU_OP_STRING_IS:
-        case KU_OP_STRING_STARTS_WITH:
-        case KU_OP_STRING_ENDS_WITH:
-        case KU_OP_STRING_CONTAINS: {
-            const auto &  literal = p_constants[p->constant].text;
-            column_string c       = {{}, program.texts() + literal.offset, literal.length};
-            if (!ku_read_item(slot(*p), the_row.indirect, &c.item) || !ku_item_is_terminated(c.item))
-                return KU_EXPR_E_DAMAGED_VALUE;
-            truth = test_string(*p, c);
-            break;
-        }
+#define KU_COLUMN_TEST(operation)                                                                                      \
+    case operation: {                                                                                                  \
+        const ku_finding_t found = ku_test_column<operation>(program, *p, row);                                        \
+        if (found == KU_FOUND_DAMAGED)                                                                                 \
+            return KU_EXPR_E_DAMAGED_VALUE;                                                                            \
+        truth = found == KU_FOUND_TRUE;                                                                                \
+        break;                                                                                                         \
+    }
+            KU_FOR_EACH_COLUMN_TEST(KU_COLUMN_TEST)
+#undef KU_COLUMN_TEST
 
         case KU_OP_COMPARE_INTEGERS:
             top -= 2;
@@ -413,11 +320,10 @@ template <kt_uint32_t Room>
 
 } // namespace
 
-kt_int32_t ku_expr_run(const ku_program_t & program, const uint8_t * p_values, kt_uint32_t * p_result,
-                       const uint8_t * p_indirect_data, kt_uint32_t indirect_length)
+kt_int32_t ku_expr_run(const ku_program_t & program, const ku_instruction_t * p_first, const ku_row_t & row,
+                       kt_uint32_t * p_result)
 {
-    const row the_row = {p_values, {p_indirect_data, indirect_length}};
     if (program.stack_needed <= usual_stack)
-        return run<usual_stack>(program, the_row, p_result);
-    return run<ku_expr_deepest_stack>(program, the_row, p_result);
+        return run<usual_stack>(program, p_first, row, p_result);
+    return run<ku_expr_deepest_stack>(program, p_first, row, p_result);
 }

@@ -470,7 +470,7 @@ kt_int32_t parser::read_list(const char * p_at, bool negated, ku_operand_t * p_r
     } while (token_.kind == KU_TOKEN_COMMA);
     if (const kt_int32_t rc = expect(KU_TOKEN_CLOSE, "`,` or `)`"); rc != 0)
         return rc;
-    code_.list_end(negated, chain);
+    code_.list_end(*p_result, negated, chain);
     become_truth(p_result);
     leave();
     return 0;

@@ -708,10 +708,28 @@ class inventor
         return below(3) == 0 ? element("ab") : column({KT_BINARY_PTR});
     }
 
+    // A column among up to 40 constants, every eighth time itself.
+    tree some_list_of_constants()
+    {
+        const bool        strings = below(3) == 0;
+        const tree        scalar  = strings ? column({KT_CHAR_PTR})
+                                            : column({KT_INT32, KT_UINT32, KT_INT64, KT_UINT64, KT_FLOAT32, KT_FLOAT64});
+        std::vector<tree> kids{scalar};
+        for (unsigned n = 1 + below(below(2) == 0 ? 4 : 40); n > 0; n--) {
+            if (strings)
+                kids.push_back(string_literal());
+            else
+                kids.push_back(below(3) == 0 ? floating_literal() : integer_literal());
+        }
+        if (below(8) == 0)
+            kids.push_back(scalar);
+        return make("list", kids, below(2) == 0);
+    }
+
     tree some_comparison(int depth)
     {
         static const char * relations[] = {"==", "!=", "<", "<=", ">", ">="};
-        switch (below(12)) {
+        switch (below(14)) {
         case 0:
             return make(relations[below(6)], {some_string_node(depth - 1), some_string_node(depth - 1)});
         case 1:
@@ -741,7 +759,9 @@ class inventor
                 kids.push_back(some_string_node(0));
             return make("list", kids, below(2) == 0);
         }
-        case 8: {
+        case 8:
+            return some_list_of_constants();
+        case 9: {
             const tree scalar  = column({KT_INT32, KT_UINT32, KT_INT64, KT_UINT64, KT_FLOAT32, KT_FLOAT64});
             const tree literal = below(2) == 0 ? integer_literal() : floating_literal();
             return make(relations[below(6)],

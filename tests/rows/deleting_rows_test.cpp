@@ -1,5 +1,7 @@
 // SPDX-License-Identifier: MIT
 // Deleting rows: by packed index, all of them, and those that match criteria.
+#include <algorithm>
+
 #include "support/faults.h"
 #include "support/rows.h"
 
@@ -189,6 +191,29 @@ TEST_P(deleting_rows, judges_rows_by_their_applied_state)
     ASSERT_EQ(add_row(table, {{"id", uint32(9)}, {"n", int32(100)}}), 0);
     ASSERT_EQ(rg_delete_rows_1(table, text("n == 100")), 0);
     EXPECT_EQ(live_ids(table), (ids{0, 2}));
+}
+
+TEST_P(deleting_rows, deletes_exactly_those_that_match_however_many_there_are)
+{
+    constexpr kt_uint32_t    rows  = 330;
+    const rg_opaque_handle_t table = make_numbered(rows);
+    ASSERT_EQ(commit(table), 0);
+    ASSERT_EQ(rg_delete_rows_1(table, text("id in (0, 63, 64, 127, 128, 329, 1000, -1, 65.0, 66.5)")), 0);
+    ASSERT_EQ(rg_delete_rows_1(table, text("id >= 130 && id < 260 && n != 1")), 0);
+    ids expected;
+    for (kt_uint32_t id = 0; id < rows; ++id)
+        if (id != 0 && id != 63 && id != 64 && id != 65 && id != 127 && id != 128 && id != 329 &&
+            (id < 130 || id >= 260 || id % 3 == 1))
+            expected.push_back(id);
+    EXPECT_EQ(live_ids(table), expected);
+    ASSERT_EQ(commit(table), 0);
+    ids left = live_ids(table);
+    std::sort(left.begin(), left.end());
+    EXPECT_EQ(left, expected);
+    ASSERT_EQ(rg_delete_rows_1(table, nullptr), 0);
+    EXPECT_EQ(live_ids(table), ids{});
+    ASSERT_EQ(commit(table), 0);
+    EXPECT_EQ(object_of(table).total_applied_rows, 0u);
 }
 
 TEST_P(deleting_rows, that_no_criteria_match_is_a_success_without_a_change)

@@ -451,6 +451,62 @@ TEST_P(selecting_rows, lists_the_applied_state_of_a_table_that_shows_it)
     EXPECT_EQ(selected(table, nullptr, 0), (ids{0, 1}));
 }
 
+// Slots where the rows of numbered tables stand that satisfy a condition; their slots are their ids.
+template <class Condition> ids ids_below(kt_uint32_t end, Condition condition)
+{
+    ids result;
+    for (kt_uint32_t id = 0; id < end; ++id)
+        if (condition(id))
+            result.push_back(id);
+    return result;
+}
+
+TEST_P(selecting_rows, of_any_number_gives_exactly_those_that_match)
+{
+    const rg_opaque_handle_t table = make_numbered(0);
+    kt_uint32_t              rows  = 0;
+    for (const kt_uint32_t more : {1u, 62u, 1u, 1u, 62u, 1u, 1u, 64u, 120u}) {
+        add_numbered(table, rows, rows + more);
+        rows += more;
+        ASSERT_EQ(commit(table), 0);
+        EXPECT_EQ(selected(table, nullptr), ids_below(rows, [](kt_uint32_t) { return true; }));
+        const ids expected = ids_below(rows, [](kt_uint32_t id) { return id % 3 == 1 && id % 2 == 1 && id != 7; });
+        const char * const p_criteria = "n == 1 && s like \"od%\" && id not in (7, 8)";
+        EXPECT_EQ(selected(table, p_criteria), expected) << rows;
+        const rg_opaque_handle_t result = select(table, {}, p_criteria);
+        EXPECT_EQ(column_ids(result), expected) << rows;
+        EXPECT_EQ(rg_close_table_1(result), 0);
+    }
+}
+
+TEST_P(selecting_rows, passes_over_holes_wherever_they_are)
+{
+    constexpr kt_uint32_t    rows  = 300;
+    const rg_opaque_handle_t table = make_numbered(rows);
+    ASSERT_EQ(commit(table), 0);
+    // The first row, the last one, whole stretches of 64 and more, and single ones.
+    ASSERT_EQ(rg_delete_rows_1(table, text("id == 0 || id >= 60 && id < 200 || id % 7 == 6 || id == 299")), 0);
+    ASSERT_EQ(commit(table), 0);
+    const auto is_there = [](kt_uint32_t id) {
+        return !(id == 0 || (id >= 60 && id < 200) || id % 7 == 6 || id == 299);
+    };
+    EXPECT_EQ(selected(table, nullptr), ids_below(rows, is_there));
+    EXPECT_EQ(selected(table, "s == \"even\""),
+              ids_below(rows, [&](kt_uint32_t id) { return is_there(id) && id % 2 == 0; }));
+    const rg_opaque_handle_t result = select(table, {}, "n != 2");
+    EXPECT_EQ(column_ids(result), ids_below(rows, [&](kt_uint32_t id) { return is_there(id) && id % 3 != 2; }));
+
+    // And those that are pending: 201 is deleted, 204 updated.
+    ASSERT_EQ(rg_delete_rows_1(table, text("id == 201")), 0);
+    ASSERT_EQ(set_fields_by_key(table, uint32(204), {{"s", string("odd")}}), 0);
+    EXPECT_EQ(selected(table, "s == \"even\" && id > 200", 0),
+              ids_below(rows, [&](kt_uint32_t id) { return is_there(id) && id % 2 == 0 && id > 204; }));
+    EXPECT_EQ(selected(table, "s == \"odd\" && id >= 200 && id < 206", 0), (ids{203, 204, 205}));
+    EXPECT_EQ(selected(table, "id >= 200 && id < 206", 0), (ids{200, 203, 204, 205}));
+    EXPECT_EQ(selected(table, nullptr, 1), ids_below(rows, [&](kt_uint32_t id) { return is_there(id) && id != 201; }));
+    EXPECT_EQ(selected(table, nullptr, 0), ids_below(rows, is_there));
+}
+
 TEST_P(selecting_rows, refuses_wrong_arguments_of_the_list)
 {
     const rg_opaque_handle_t table = make_numbered(2);
