@@ -12,6 +12,7 @@
 #include <filesystem>
 #include <string>
 
+#include "common/kt_rg_rows.h"
 #include "kt_rg.h"
 
 namespace
@@ -24,20 +25,6 @@ void must(kt_int32_t rc, const char * p_what)
         std::abort();
     }
 }
-
-kt_uint32_t hash_key(void * p_key)
-{
-    kt_uint64_t key;
-    std::memcpy(&key, p_key, sizeof key);
-    return static_cast<kt_uint32_t>(key * 0x9E3779B97F4A7C15u >> 47);
-}
-
-kt_int32_t compare_keys(void * p_key1, void * p_key2)
-{
-    return std::memcmp(p_key1, p_key2, sizeof(kt_uint64_t));
-}
-
-constexpr kt_uint32_t buckets = 1u << 17;
 
 char id_name[] = "id", count_name[] = "count", ratio_name[] = "ratio", name_name[] = "name", note_name[] = "note";
 char extra_name[]  = "extra";
@@ -54,10 +41,11 @@ rg_opaque_handle_t filled(rg_opaque_handle_t tree, char * p_path, std::int64_t r
     columns[2] = {ratio_name, KT_FLOAT64, RG_STANDARD, 0, nullptr, {}};
     columns[3] = {name_name, KT_CHAR_PTR, RG_STANDARD, 0, nullptr, {}};
     columns[4] = {note_name, KT_CHAR_PTR, RG_STANDARD, 0, nullptr, {}};
-    rg_opaque_handle_t table = nullptr;
-    const kt_int32_t   mode  = RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL;
+    rg_opaque_handle_t   table = nullptr;
+    const kt_int32_t     mode  = RG_MODE_WRITE | RG_MODE_EXPLICIT_CONTROL;
+    const bench::hashing h     = bench::hashing_for(false, static_cast<std::size_t>(rows));
     must(kind == key::hashed
-             ? rg_create_hashed_key_table_1(tree, p_path, columns, 5, mode, buckets, hash_key, compare_keys, &table)
+             ? rg_create_hashed_key_table_1(tree, p_path, columns, 5, mode, h.buckets, h.p_hash, h.p_compare, &table)
              : rg_create_table_1(tree, p_path, columns, 5, mode, &table),
          "create");
     kt_char_ptr_t names[]{id_name, count_name, ratio_name, name_name, note_name};
