@@ -129,7 +129,8 @@ std::vector<std::pair<const line *, double>> label_places(const chart & c, const
 {
     std::vector<std::pair<const line *, double>> places;
     for (const line & l : c.lines)
-        places.emplace_back(&l, y.at(l.points.back().second));
+        if (!l.label.empty())
+            places.emplace_back(&l, y.at(l.points.back().second));
     std::sort(places.begin(), places.end(), [](const auto & a, const auto & b) { return a.second < b.second; });
     double least = top;
     for (auto & [p_line, at] : places) {

@@ -12,7 +12,7 @@ namespace bench
 {
 
 struct line {
-    std::string                            label;
+    std::string                            label; // empty: none
     std::string                            color;
     std::string                            dashes; // as SVG has them; empty: none
     double                                 width;
