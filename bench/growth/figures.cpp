@@ -23,6 +23,16 @@ constexpr double same_for_disks      = 2;
 constexpr std::size_t rewritten_above = 86'000'000;
 constexpr std::size_t bytes_of_a_row  = 115;
 
+// The largest size measured that isn't larger.
+std::size_t measured_size(const figures & all, std::size_t rows)
+{
+    std::size_t found = 0;
+    for (const std::size_t size : all.sizes_of("memory access", state::fresh))
+        if (size <= rows)
+            found = size;
+    return found;
+}
+
 // What following a pointer costs at one size more than at another.
 std::optional<double> dearer_access(const figures & all, std::size_t from, std::size_t to)
 {
@@ -121,11 +131,12 @@ std::optional<growth_of_curve> growth_of(const figures & all, const curve & c, s
         return g;
     }
     // A file with ten versions of each row holds ten times the rows.
-    const double most     = s == state::versions && c.in == family::files ? 10 * c.accesses : c.accesses;
-    const auto   dearer   = dearer_access(all, from, to);
-    const auto   accesses = dearer ? (after - before) / *dearer : 0;
-    g.explained           = dearer && accesses <= most;
-    g.why                 = fmt::format("{}: as much as {:.1f} accesses to memory cost more, of {:g} or fewer: {}",
+    const std::size_t versions = s == state::versions && c.in == family::files ? 10 : 1;
+    const double      most     = static_cast<double>(versions) * c.accesses;
+    const auto dearer   = dearer_access(all, measured_size(all, from * versions), measured_size(all, to * versions));
+    const auto accesses = dearer ? (after - before) / *dearer : 0;
+    g.explained         = dearer && accesses <= most;
+    g.why               = fmt::format("{}: as much as {:.1f} accesses to memory cost more, of {:g} or fewer: {}",
                         g.explained ? "caches" : "**not explained**", accesses, most, c.why);
     return g;
 }

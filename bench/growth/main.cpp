@@ -67,6 +67,7 @@ void measure_in_memory(run & r, state s)
              measure_rows(r, t);
              measure_packed(r, t);
              measure_columns(r, t);
+             settle_heap();
              measure_transactions(r, t);
          }));
 }

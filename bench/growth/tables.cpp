@@ -8,6 +8,7 @@
 #include <numeric>
 #include <random>
 
+#include "common/machine.h"
 #include "common/require.h"
 
 namespace growth
@@ -36,6 +37,17 @@ void apply_and_commit(rg_opaque_handle_t table)
 {
     check(rg_apply_1(table, 0), "apply");
     check(rg_commit_1(table), "commit");
+}
+
+void settle_heap()
+{
+    constexpr int         enough = 2'000;
+    constexpr std::size_t large  = 1 << 20;
+    for (int i = 0; i < enough; ++i) {
+        void * p_block = std::malloc(large);
+        use(p_block);
+        std::free(p_block);
+    }
 }
 
 kt_char_ptr_t any_note(std::uint64_t seed)
@@ -120,6 +132,7 @@ table_in_memory::table_in_memory(std::size_t rows, state s, bool hashed) : rows_
         next_id_ = rows;
     }
     require(rows_of(table_) == rows, "a table has other rows than it should");
+    settle_heap();
 }
 
 table_in_memory::~table_in_memory()

@@ -98,6 +98,11 @@ class table_in_memory
     std::uint64_t      next_id_ = 0;
 };
 
+// The C library's allocator sorts what was freed when it is next asked for something larger, ten thousand pieces at a
+// time. After millions of pieces that takes seconds, which belong to the call that freed them and not to what is measured
+// next: this does it.
+void settle_heap();
+
 // A text of any length between 0 and 120 bytes, another for each seed; the same for the same one. Good until the next.
 kt_char_ptr_t any_note(std::uint64_t seed);
 
