@@ -4,7 +4,7 @@
 // Layer: storage. Calls the file wrappers (rg_i_files); called by the frames and by column changes.
 // Always holds: a reader of the table file stops at the old commit record until rg_i_commit acts. No byte up to the end
 // of the live commit record is touched. Appending writes behind it; rewriting writes the whole table into the rewrite
-// file. Either way rows go out 16 elements to a call at most, and there is one sync.
+// file. Either way a call has 16 elements at most, and there is one sync.
 // Locking: the caller holds the table's write lock.
 // Failure: ready_for_commit stays 0, and lists and records stay as they were: the caller may apply again, or abort.
 // Stamps of file offsets stay; the next apply overwrites those of the rows that it writes.
@@ -88,7 +88,8 @@ template <class Action> [[nodiscard]] kt_int32_t for_each_written_row(const appl
     return length;
 }
 
-// One buffer for all rows.
+// One buffer, with room for all rows: memory that isn't there is found out before anything is written. Little of it is
+// touched, since it is begun anew after each write.
 [[nodiscard]] bool allocate_rows(apply_t & apply, kt_uint64_t disk_length)
 {
     apply.rows.reset(static_cast<kt_char_ptr_t>(std::malloc(disk_length != 0 ? disk_length : 1)));
@@ -109,11 +110,8 @@ void build_row_record(const apply_t & apply, rg_i_index_entry_t & entry, kt_char
 {
     kt_char_ptr_t p_disk_record = apply.rows.get();
     return for_each_written_row(apply, [&](rg_i_index_entry_t & entry) {
-        const kt_uint32_t record_length = rg_i_disk_length_of(entry.p_applied);
         build_row_record(apply, entry, p_disk_record, writer.file_offset);
-        rg_i_queue(writer, p_disk_record, record_length);
-        p_disk_record += record_length;
-        return rg_i_write_if_full(writer);
+        return rg_i_queue_built(writer, apply.rows.get(), &p_disk_record, rg_i_disk_length_of(entry.p_applied));
     });
 }
 

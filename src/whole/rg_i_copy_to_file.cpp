@@ -114,17 +114,11 @@ struct image_t {
     rg_i_queue(writer, image.metadata.get(), rg_i_load_u32(image.metadata.get()));
 
     kt_char_ptr_t p_disk_record = image.rows.get();
-    if (const kt_int32_t rc = rg_i_for_each_applied_row(table,
-                                                        [&](const rg_i_index_entry_t & entry) {
-                                                            const kt_uint32_t length =
-                                                                rg_i_disk_length_of(entry.p_applied);
-                                                            rg_i_build_row_record(entry.p_applied, p_disk_record,
-                                                                                  row_record::stands_alone);
-                                                            rg_i_queue(writer, p_disk_record, length);
-                                                            p_disk_record += length;
-                                                            return rg_i_write_if_full(writer);
-                                                        });
-        rc != 0)
+    const auto    write_row     = [&](const rg_i_index_entry_t & entry) {
+        rg_i_build_row_record(entry.p_applied, p_disk_record, row_record::stands_alone);
+        return rg_i_queue_built(writer, image.rows.get(), &p_disk_record, rg_i_disk_length_of(entry.p_applied));
+    };
+    if (const kt_int32_t rc = rg_i_for_each_applied_row(table, write_row); rc != 0)
         return rc;
     rg_i_queue(writer, image.commit_record.get(), image.commit_record_length);
     if (const kt_int32_t rc = rg_i_write_queued(writer); rc != 0)

@@ -141,10 +141,11 @@ TEST_F(applying, an_implicit_update_makes_exactly_two_syncs)
     EXPECT_EQ(calls_made(call::fsync), 2u);
 }
 
-TEST_F(applying, writes_at_most_16_records_to_a_call)
+TEST_F(applying, writes_16_records_with_the_first_call_and_64_kib_with_each_further_one)
 {
-    // 15 rows and the commit record are 16; one row more makes a second call.
-    for (const auto & [row_count, calls] : {std::pair{15u, 1u}, {16u, 2u}, {31u, 2u}, {32u, 3u}, {100u, 7u}}) {
+    // 15 rows and the commit record are 16; one row more makes a second call. Some 2,000 rows of 32 bytes and a few more fill a further one.
+    for (const auto & [row_count, calls] :
+         {std::pair{15u, 1u}, {16u, 2u}, {31u, 2u}, {100u, 2u}, {16u + 1900u, 2u}, {16u + 2100u, 3u}}) {
         registry_at        other;
         rg_opaque_handle_t table = other.create(explicitly);
         for (std::uint32_t id = 0; id < row_count; ++id)
@@ -324,10 +325,11 @@ TEST_F(applying, reports_each_fault_of_an_append_and_leaves_the_table_as_it_was)
 
 TEST_F(applying, reports_a_fault_of_each_of_several_writes)
 {
+    constexpr std::uint32_t row_count = 16 + 2 * 2100;
     for (unsigned nth = 1; nth <= 4; ++nth) {
         registry_at        other;
         rg_opaque_handle_t table = other.create(explicitly);
-        for (std::uint32_t id = 0; id < 60; ++id)
+        for (std::uint32_t id = 0; id < row_count; ++id)
             EXPECT_EQ(add(table, id, id), 0);
         reset_calls();
         fail_call(call::writev, nth, EIO);
@@ -337,7 +339,7 @@ TEST_F(applying, reports_a_fault_of_each_of_several_writes)
         reset_calls();
         EXPECT_EQ(rg_apply_1(table, 0), 0);
         EXPECT_EQ(rg_commit_1(table), 0);
-        EXPECT_EQ(state_in(other.dir.path()).rows.size(), 60u);
+        EXPECT_EQ(state_in(other.dir.path()).rows.size(), row_count);
     }
 }
 
@@ -360,6 +362,25 @@ TEST_F(applying, survives_short_writes_of_every_length)
         EXPECT_EQ(rg_apply_1(table, 0), 0) << length;
         EXPECT_EQ(rg_commit_1(table), 0);
         EXPECT_EQ(state_in(other.dir.path()), changed) << length;
+    }
+}
+
+TEST_F(applying, goes_on_in_the_middle_of_many_records_after_a_short_write)
+{
+    constexpr std::uint32_t row_count = 16 + 2100;
+    for (const size_t length : {1u, 31u, 32u, 33u, 40'000u, 65'535u}) {
+        registry_at        other;
+        rg_opaque_handle_t table = other.create(explicitly);
+        file_state         expected{0, 2, {}};
+        for (std::uint32_t id = 0; id < row_count; ++id) {
+            EXPECT_EQ(add(table, id, id * 3), 0);
+            expected.rows[id] = id * 3;
+        }
+        reset_calls();
+        shorten_write(call::writev, 2, length);
+        EXPECT_EQ(rg_apply_1(table, 0), 0);
+        EXPECT_EQ(rg_commit_1(table), 0);
+        EXPECT_EQ(state_in(other.dir.path()), expected) << length;
     }
 }
 
@@ -536,7 +557,8 @@ TEST_F(applying_by_rewriting, writes_the_table_whole_and_leaves_the_old_file_alo
 
 TEST_F(applying_by_rewriting, fourteen_rows_take_one_write_and_fifteen_two)
 {
-    for (const auto & [row_count, calls] : {std::pair{14u, 1u}, {15u, 2u}, {30u, 2u}, {31u, 3u}}) {
+    for (const auto & [row_count, calls] :
+         {std::pair{14u, 1u}, {15u, 2u}, {30u, 2u}, {31u, 2u}, {15u + 1900u, 2u}, {15u + 2100u, 3u}}) {
         registry_at        other;
         rg_opaque_handle_t table = other.create(explicitly);
         for (std::uint32_t id = 0; id < row_count; ++id)
