@@ -68,6 +68,9 @@ struct rg_i_record_buffer_pool_t {
     rg_i_kept_blocks_t *       p_kept_blocks;         // what shares the blocks with pools that lead into them, or NULL
     rg_i_kept_blocks_t *       p_lender;              // the blocks that records of this pool lead into, or NULL
     kt_char_ptr_t              p_lent_metadata;       // the metadata record there that the names of this one lie in
+    kt_char_ptr_t *            p_gathered;            // records to be freed together, while rg_i_rb_gather_frees is on
+    kt_uint32_t                gathered;
+    kt_uint32_t                most_gathered;
 };
 
 static_assert(offsetof(rg_i_record_buffer_pool_t, p_free_chain) == 8 &&
@@ -113,6 +116,11 @@ kt_int32_t               rg_i_rb_uninitialize_record_buffer_pool(rg_i_record_buf
                                                  kt_char_ptr_t p_previous_free_record, kt_uint32_t data_length,
                                                  kt_uint32_t record_type);
 kt_int32_t               rg_i_rb_free_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_char_ptr_t p_data);
+// Between the two, what rg_i_rb_free_record is given stays as it is, and then goes in the order of addresses: the same
+// outcome, but neighbours go one after the other instead of each being looked for anywhere in memory. Nothing may be
+// allocated meanwhile. Without memory for so many addresses, or for few of them, each record goes at once.
+void        rg_i_rb_gather_frees(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_uint32_t expected);
+void        rg_i_rb_free_gathered(rg_i_record_buffer_pool_t * p_record_buffer_pool);
 kt_uint32_t rg_i_rb_insert_free_record(kt_char_ptr_t p_new_free_record, kt_char_ptr_t * p_free_chain_returned,
                                        kt_char_ptr_t * p_previous_free_record_returned);
 // Find and allocate in one, for a length known beforehand. The data is all zero.

@@ -51,6 +51,7 @@ static_assert(sizeof(rg_i_change_entry_t) == 28 && offsetof(rg_i_change_entry_t,
 inline constexpr kt_uint32_t RG_I_IO_VECTOR_ELEMENTS = 16;
 
 struct rg_i_key_index_t;
+struct rg_i_change_chunk_t;
 
 struct rg_i_table_struct_t {
     kt_char_ptr_t p_name;   // key in p_tables; the file's path for a persistent table; NULL: unnamed. Owned; guarded
@@ -104,7 +105,8 @@ struct rg_i_table_struct_t {
     rg_i_record_buffer_pool_t     record_buffer_pool;
     struct iovec                  io_vector[RG_I_IO_VECTOR_ELEMENTS]; // scratch for gathering writes
     rg_i_key_index_t *            p_key_index; // leads to keys where there is no hash table; owned; NULL: none
-    kt_uint64_t key_walk_rows;                 // rows that walks over the keys have looked at, while there is no index
+    kt_uint64_t           key_walk_rows;       // rows that walks over the keys have looked at, while there is no index
+    rg_i_change_chunk_t * p_change_chunks;     // what the entries of the change lists are taken from; owned
     kt_uint32_t phantom_references; // of references, those that no handle stands for; guarded by the tree's lock
 };
 using rg_i_table_t = rg_i_table_struct_t;
@@ -176,12 +178,18 @@ inline void rg_i_store_u32(void * p, kt_uint32_t word)
 [[nodiscard]] kt_char_ptr_t rg_i_default_data(const rg_i_table_t * p_table);
 [[nodiscard]] kt_uint32_t   rg_i_default_data_length(const rg_i_table_t * p_table);
 
-// Column by name, or total_columns if there is none. The one place where names are matched.
+// Whether two column names are the same. Most differ in their first byte.
+[[nodiscard]] inline bool rg_i_same_name(const kt_char_t * p_name1, const kt_char_t * p_name2)
+{
+    return *p_name1 == *p_name2 && std::strcmp(p_name1, p_name2) == 0;
+}
+
+// Column by name, or total_columns if there is none.
 [[nodiscard]] inline kt_uint32_t rg_i_find_column(const rg_i_table_t * p_table, const kt_char_t * p_column_name)
 {
     const kt_uint32_t total_columns = p_table->total_columns;
     for (kt_uint32_t column = 0; column < total_columns; ++column)
-        if (std::strcmp(p_table->p_columns[column].name, p_column_name) == 0)
+        if (rg_i_same_name(p_table->p_columns[column].name, p_column_name))
             return column;
     return total_columns;
 }

@@ -14,6 +14,7 @@
 #include <utility>
 
 #include "rg_i_read_write_lock.h"
+#include "rg_i_record_buffer_pool.h"
 
 // code() is the result of the lock. Unlocks only what it locked.
 class mutex_guard
@@ -146,4 +147,20 @@ template <class Action> class rollback
   private:
     Action action_;
     bool   armed_ = true;
+};
+
+// Records that are freed in the scope go together at its end.
+class gathered_frees
+{
+  public:
+    gathered_frees(rg_i_record_buffer_pool_t & pool, kt_uint32_t expected) : pool_(pool)
+    {
+        rg_i_rb_gather_frees(&pool_, expected);
+    }
+    ~gathered_frees() { rg_i_rb_free_gathered(&pool_); }
+    gathered_frees(const gathered_frees &)             = delete;
+    gathered_frees & operator=(const gathered_frees &) = delete;
+
+  private:
+    rg_i_record_buffer_pool_t & pool_;
 };

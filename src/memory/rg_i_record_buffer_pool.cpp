@@ -32,6 +32,8 @@ constexpr kt_uint32_t smallest_remainder = RG_I_RECORD_HEAD_LENGTH + 2; // less 
 constexpr kt_uint32_t big_request         = 65536;
 constexpr kt_uint32_t small_requests_each = 100;
 
+constexpr kt_uint32_t fewest_to_gather = 256; // for fewer, sorting isn't worth its memory
+
 using pool_t  = rg_i_record_buffer_pool_t;
 using block_t = rg_i_record_buffer_t;
 using map_t   = rg_i_record_buffer_pool_duplication_map_t;
@@ -117,6 +119,15 @@ kt_uint32_t insert_free_record(pool_t * p_pool, rg_i_block_index_t * p_block, kt
         joins_previous ? place_t{p_previous, nullptr, p_block} : place_t{p_record, p_previous, p_block};
     rg_i_move_hint_after_freeing(p_pool->p_free_index, freed, !joins_previous, joins_next ? p_next : nullptr);
     return used_bytes_freed;
+}
+
+void free_at_once(pool_t * p_pool, kt_char_ptr_t p_data)
+{
+    const kt_char_ptr_t        p_record = p_data - RG_I_RECORD_HEAD_LENGTH;
+    rg_i_block_index_t * const p_block  = rg_i_block_of(p_pool->p_free_index, p_record);
+    assert(p_block != nullptr);
+    head_at(p_record)->type = RG_RECORD_TYPE_FREE;
+    p_pool->used_bytes -= insert_free_record(p_pool, p_block, p_record);
 }
 
 // ---- Blocks ----
@@ -309,12 +320,32 @@ kt_int32_t rg_i_rb_allocate_record(rg_i_record_buffer_pool_t * p_record_buffer_p
 
 kt_int32_t rg_i_rb_free_record(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_char_ptr_t p_data)
 {
-    const kt_char_ptr_t        p_record = p_data - RG_I_RECORD_HEAD_LENGTH;
-    rg_i_block_index_t * const p_block  = rg_i_block_of(p_record_buffer_pool->p_free_index, p_record);
-    assert(p_block != nullptr);
-    head_at(p_record)->type = RG_RECORD_TYPE_FREE;
-    p_record_buffer_pool->used_bytes -= insert_free_record(p_record_buffer_pool, p_block, p_record);
+    pool_t & pool = *p_record_buffer_pool;
+    if (pool.gathered < pool.most_gathered)
+        pool.p_gathered[pool.gathered++] = p_data;
+    else
+        free_at_once(p_record_buffer_pool, p_data);
     return 0;
+}
+
+void rg_i_rb_gather_frees(rg_i_record_buffer_pool_t * p_record_buffer_pool, kt_uint32_t expected)
+{
+    if (expected < fewest_to_gather)
+        return;
+    p_record_buffer_pool->p_gathered = static_cast<kt_char_ptr_t *>(std::malloc(expected * sizeof(kt_char_ptr_t)));
+    if (p_record_buffer_pool->p_gathered != nullptr)
+        p_record_buffer_pool->most_gathered = expected;
+}
+
+void rg_i_rb_free_gathered(rg_i_record_buffer_pool_t * p_record_buffer_pool)
+{
+    pool_t & pool = *p_record_buffer_pool;
+    std::sort(pool.p_gathered, pool.p_gathered + pool.gathered);
+    for (kt_uint32_t i = 0; i < pool.gathered; ++i)
+        free_at_once(p_record_buffer_pool, pool.p_gathered[i]);
+    std::free(pool.p_gathered);
+    pool.p_gathered = nullptr;
+    pool.gathered = pool.most_gathered = 0;
 }
 
 kt_uint32_t rg_i_rb_insert_free_record(kt_char_ptr_t p_new_free_record, kt_char_ptr_t * p_free_chain_returned,

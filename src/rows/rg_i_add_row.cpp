@@ -33,10 +33,11 @@ constexpr kt_uint32_t guessed_bytes_per_indirect_column = 32;
                                        kt_value_t ** p_p_values, kt_uint32_t total_values,
                                        kt_value_t ** p_p_input_key_value)
 {
-    const rg_i_table_t * p_table           = p_row->p_table;
-    kt_uint32_t          input_values_used = 0;
+    const rg_i_table_t *   p_table           = p_row->p_table;
+    kt_uint32_t            input_values_used = 0;
+    rg_i_argument_search_t arguments{p_column_names, total_values};
     for (kt_uint32_t column = 0; column < p_table->total_columns; ++column) {
-        const kt_uint32_t i = rg_i_find_argument(p_column_names, total_values, p_table->p_columns[column].name);
+        const kt_uint32_t i = arguments.find(p_table->p_columns[column].name);
         if (i < total_values) {
             if (const kt_int32_t rc = rg_i_row_builder_store_value(p_row, column, p_p_values[i]); rc != 0)
                 return rc;

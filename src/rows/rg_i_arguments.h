@@ -2,9 +2,7 @@
 // rg_i_arguments: the parallel arrays of column names and values that the calls on several fields take.
 #pragma once
 
-#include <cstring>
-
-#include "kt_rg.h"
+#include "rg_i_table.h"
 
 // Whether an array, a name or a value is NULL. Arrays of no entries are not looked at.
 [[nodiscard]] inline bool rg_i_any_argument_is_null(kt_char_ptr_t * p_column_names, kt_value_t ** p_p_values,
@@ -25,7 +23,25 @@
                                                     const kt_char_t * p_name)
 {
     for (kt_uint32_t i = 0; i < total_values; ++i)
-        if (std::strcmp(p_column_names[i], p_name) == 0)
+        if (rg_i_same_name(p_column_names[i], p_name))
             return i;
     return total_values;
 }
+
+// Finds the arguments of the columns, which must be asked for in their order, each once. Callers mostly name them in that
+// order: the name behind the last one found is looked at first. It can't be the second of two equal names then, since
+// those ahead of it belong to other columns.
+struct rg_i_argument_search_t {
+    kt_char_ptr_t * p_column_names;
+    kt_uint32_t     total_values;
+    kt_uint32_t     in_order = 0; // so many names were found one after the other
+
+    [[nodiscard]] kt_uint32_t find(const kt_char_t * p_name)
+    {
+        if (in_order == total_values)
+            return total_values;
+        if (rg_i_same_name(p_column_names[in_order], p_name))
+            return in_order++;
+        return rg_i_find_argument(p_column_names, total_values, p_name);
+    }
+};

@@ -75,17 +75,11 @@ kt_int32_t rg_i_row_builder_open(rg_i_row_builder_t * p_row, rg_i_table_t * p_ta
     return acquire_row_record(*p_row, wanted_length);
 }
 
-kt_int32_t rg_i_row_builder_store_value(rg_i_row_builder_t * p_row, kt_uint32_t column, kt_value_t * p_client_value)
+kt_int32_t rg_i_row_builder_store_indirect(rg_i_row_builder_t * p_row, kt_uint32_t column, kt_value_t * p_client_value)
 {
     rg_i_row_builder_t & row  = *p_row;
     const kt_data_type_t type = row.p_table->p_columns[column].type;
-    if (!rg_i_type_is_indirect(type)) {
-        // All eight bytes, whatever the type's width: the rest is whatever the union held.
-        std::memcpy(rg_i_row_slot(row.p_record, column), p_client_value, sizeof *p_client_value);
-        return 0;
-    }
-
-    kt_value_t value;
+    kt_value_t           value;
     rg_i_dup_nonscalar_value(type, p_client_value, &value);
     for (;;) {
         const kt_int32_t result = kt_pmsg_build_conv_protocol_value_1(
@@ -100,28 +94,25 @@ kt_int32_t rg_i_row_builder_store_value(rg_i_row_builder_t * p_row, kt_uint32_t 
     }
 }
 
-kt_int32_t rg_i_row_builder_carry_value(rg_i_row_builder_t * p_row, kt_uint32_t column, const void * p_slot,
-                                        const kt_char_t * p_indirect_data, kt_uint32_t indirect_length,
-                                        room_grows growth)
+kt_int32_t rg_i_row_builder_carry_indirect(rg_i_row_builder_t * p_row, kt_uint32_t column, const void * p_slot,
+                                           const kt_char_t * p_indirect_data, kt_uint32_t indirect_length,
+                                           room_grows growth)
 {
-    rg_i_row_builder_t & row = *p_row;
-    kt_pmsg_value_t      stored;
-    std::memcpy(&stored, p_slot, sizeof stored);
-    if (rg_i_type_is_indirect(row.p_table->p_columns[column].type)) {
-        kt_pmsg_value_anchor_t & anchor = stored.val_anchor;
-        if (anchor.offset > indirect_length || anchor.length > indirect_length - anchor.offset)
-            return rg_i_fail(RG_HERE, RG_E_TABLE_UNREADABLE);
-        while (anchor.length > row.capacity - length_so_far(row)) {
-            const kt_int32_t rc = growth == room_grows::by_doubling ? acquire_doubled_row_record(row)
-                                                                    : acquire_longer_row_record(row, anchor.length);
-            if (rc != 0)
-                return rc;
-        }
-        std::memcpy(indirect_data(row) + row.running_offset, p_indirect_data + anchor.offset, anchor.length);
-        anchor.offset = row.running_offset;
-        row.running_offset += anchor.length;
+    rg_i_row_builder_t &   row = *p_row;
+    kt_pmsg_value_anchor_t anchor;
+    std::memcpy(&anchor, p_slot, sizeof anchor);
+    if (anchor.offset > indirect_length || anchor.length > indirect_length - anchor.offset)
+        return rg_i_fail(RG_HERE, RG_E_TABLE_UNREADABLE);
+    while (anchor.length > row.capacity - length_so_far(row)) {
+        const kt_int32_t rc = growth == room_grows::by_doubling ? acquire_doubled_row_record(row)
+                                                                : acquire_longer_row_record(row, anchor.length);
+        if (rc != 0)
+            return rc;
     }
-    std::memcpy(rg_i_row_slot(row.p_record, column), &stored, sizeof stored);
+    std::memcpy(indirect_data(row) + row.running_offset, p_indirect_data + anchor.offset, anchor.length);
+    anchor.offset = row.running_offset;
+    row.running_offset += anchor.length;
+    std::memcpy(rg_i_row_slot(row.p_record, column), &anchor, sizeof anchor);
     return 0;
 }
 

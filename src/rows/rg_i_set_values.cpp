@@ -35,11 +35,12 @@ constexpr char module_version[] = "rg_i_set_values 1.0";
                                        kt_char_ptr_t * p_column_names, kt_value_t ** p_p_values,
                                        kt_uint32_t total_values)
 {
-    const rg_i_table_t * p_table                 = p_row->p_table;
-    kt_uint32_t          input_columns_processed = 0;
+    const rg_i_table_t *   p_table                 = p_row->p_table;
+    kt_uint32_t            input_columns_processed = 0;
+    rg_i_argument_search_t arguments{p_column_names, total_values};
     for (kt_uint32_t column = 0; column < p_table->total_columns; ++column) {
         const rg_column_t & definition = p_table->p_columns[column];
-        const kt_uint32_t   i          = rg_i_find_argument(p_column_names, total_values, definition.name);
+        const kt_uint32_t   i          = arguments.find(definition.name);
         if (i == total_values) {
             if (const kt_int32_t rc = store_unnamed(p_row, column, p_from_record); rc != 0)
                 return rc;

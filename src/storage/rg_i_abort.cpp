@@ -9,10 +9,13 @@
 
 #include <cstdint>
 
+#include "frame/rg_i_guards.h"
 #include "frame/rg_i_trace.h"
 #include "rg_i_table.h"
 #include "storage/rg_i_files.h"
 #include "storage/rg_i_table_file.h"
+#include "table/rg_i_change_entries.h"
+#include "table/rg_i_change_walk.h"
 
 namespace
 {
@@ -91,12 +94,11 @@ kt_int32_t rg_i_abort(rg_i_table_t * p_table)
 
 kt_int32_t rg_i_abort_in_memory(rg_i_table_t * p_table, rg_i_change_entry_t * p_current_change_entry)
 {
-    for (rg_i_change_entry_t * p_change = p_current_change_entry; p_change != nullptr; p_change = p_change->p_next) {
-        rg_i_index_entry_t & entry = *p_change->p_index_entry;
-        if (entry.p_committed != nullptr)
-            abort_row(*p_table, entry);
-        else if (const kt_int32_t rc = rg_i_remove_row(p_table, &entry); rc != 0)
-            return rc;
-    }
-    return 0;
+    const gathered_frees frees(p_table->record_buffer_pool, rg_i_count_change_entries(p_table));
+    return rg_i_for_each_change(*p_table, p_current_change_entry, [&](rg_i_index_entry_t & entry) -> kt_int32_t {
+        if (entry.p_committed == nullptr)
+            return rg_i_remove_row(p_table, &entry);
+        abort_row(*p_table, entry);
+        return 0;
+    });
 }

@@ -23,6 +23,7 @@
 #include "storage/rg_i_gathering_writer.h"
 #include "storage/rg_i_table_file.h"
 #include "storage/rg_i_table_image.h"
+#include "table/rg_i_change_walk.h"
 
 namespace
 {
@@ -68,14 +69,9 @@ template <class Action> [[nodiscard]] kt_int32_t for_each_written_row(const appl
     rg_i_table_t & table = apply.table;
     if (apply.rewrite != 0)
         return rg_i_for_each_applied_row(table, action);
-    for (rg_i_change_entry_t * p_change = table.p_rows_change_list; p_change != nullptr; p_change = p_change->p_next) {
-        rg_i_index_entry_t & entry = *p_change->p_index_entry;
-        if (entry.p_applied == nullptr)
-            continue;
-        if (const kt_int32_t rc = action(entry); rc != 0)
-            return rc;
-    }
-    return 0;
+    return rg_i_for_each_change(table, table.p_rows_change_list, [&](rg_i_index_entry_t & entry) {
+        return entry.p_applied != nullptr ? action(entry) : 0;
+    });
 }
 
 [[nodiscard]] kt_uint64_t disk_length_of_rows(const apply_t & apply)

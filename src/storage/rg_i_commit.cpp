@@ -21,6 +21,8 @@
 #include "storage/rg_i_disk_format.h"
 #include "storage/rg_i_files.h"
 #include "storage/rg_i_table_file.h"
+#include "table/rg_i_change_entries.h"
+#include "table/rg_i_change_walk.h"
 
 // The assertions of this file are part of what commit does: they hold in release builds too.
 #undef NDEBUG
@@ -248,12 +250,11 @@ kt_int32_t rg_i_commit(rg_i_table_t * p_table)
 
 kt_int32_t rg_i_commit_in_memory(rg_i_table_t * p_table, rg_i_change_entry_t * p_current_change_entry)
 {
-    for (rg_i_change_entry_t * p_change = p_current_change_entry; p_change != nullptr; p_change = p_change->p_next) {
-        rg_i_index_entry_t & entry = *p_change->p_index_entry;
-        if (entry.p_applied != nullptr)
-            commit_row(*p_table, entry);
-        else if (const kt_int32_t rc = rg_i_remove_row(p_table, &entry); rc != 0)
-            return rc;
-    }
-    return 0;
+    const gathered_frees frees(p_table->record_buffer_pool, rg_i_count_change_entries(p_table));
+    return rg_i_for_each_change(*p_table, p_current_change_entry, [&](rg_i_index_entry_t & entry) -> kt_int32_t {
+        if (entry.p_applied == nullptr)
+            return rg_i_remove_row(p_table, &entry);
+        commit_row(*p_table, entry);
+        return 0;
+    });
 }

@@ -16,6 +16,7 @@
 
 #include "frame/rg_i_trace.h"
 #include "memory/rg_i_large_pages.h"
+#include "rg_i_change_entries.h"
 #include "rg_i_free_slot_index.h"
 #include "storage/rg_i_disk_format.h"
 
@@ -89,15 +90,6 @@ void take_off(const change_list_t & list, rg_i_change_entry_t * p_entry)
         p_entry->p_next->p_prev = p_entry->p_prev;
     else
         list.p_tail = p_entry->p_prev;
-}
-
-void free_list(rg_i_change_entry_t * p_entry)
-{
-    while (p_entry != nullptr) {
-        rg_i_change_entry_t * p_next = p_entry->p_next;
-        std::free(p_entry);
-        p_entry = p_next;
-    }
 }
 
 // Moves the last row of the packed index into the place of one that leaves. A file whose deletions don't fit its rows
@@ -360,7 +352,7 @@ kt_int32_t rg_i_common_add_change_entry(rg_i_table_t * p_table, rg_i_index_entry
             return 0; // listed already, and keeps its place
         take_off(change_list(p_table, p_entry->deletion), p_entry);
     } else {
-        p_entry = static_cast<rg_i_change_entry_t *>(std::malloc(sizeof *p_entry));
+        p_entry = rg_i_take_change_entry(p_table);
         if (p_entry == nullptr)
             return rg_i_fail_no_memory(RG_HERE);
     }
@@ -379,8 +371,7 @@ kt_int32_t rg_i_add_change_entry(rg_i_table_t * p_table, rg_i_index_entry_t * p_
 
 void rg_i_free_change_lists(rg_i_table_t * p_table)
 {
-    free_list(p_table->p_rows_change_list);
-    free_list(p_table->p_delete_rows_change_list);
+    rg_i_forget_change_entries(p_table);
     p_table->p_rows_change_list             = nullptr;
     p_table->p_rows_change_list_tail        = nullptr;
     p_table->p_delete_rows_change_list      = nullptr;
