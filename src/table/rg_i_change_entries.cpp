@@ -41,16 +41,6 @@ rg_i_change_entry_t * entries_of(rg_i_change_chunk_t * p_chunk)
     return true;
 }
 
-// Frees chunks from the newest on, up to one that stays.
-void free_chunks_before(rg_i_table_t * p_table, const rg_i_change_chunk_t * p_staying)
-{
-    while (p_table->p_change_chunks != p_staying) {
-        rg_i_change_chunk_t * const p_older = p_table->p_change_chunks->p_older;
-        std::free(p_table->p_change_chunks);
-        p_table->p_change_chunks = p_older;
-    }
-}
-
 } // namespace
 
 rg_i_change_entry_t * rg_i_take_change_entry(rg_i_table_t * p_table)
@@ -70,18 +60,11 @@ kt_uint32_t rg_i_count_change_entries(const rg_i_table_t * p_table)
     return count;
 }
 
-void rg_i_forget_change_entries(rg_i_table_t * p_table)
+void rg_i_free_change_entries(rg_i_table_t * p_table)
 {
-    rg_i_change_chunk_t * p_first = p_table->p_change_chunks;
-    if (p_first == nullptr)
-        return;
-    while (p_first->p_older != nullptr)
-        p_first = p_first->p_older;
-    free_chunks_before(p_table, p_first);
-    p_first->taken = 0;
-}
-
-void rg_i_drop_change_entries(rg_i_table_t * p_table)
-{
-    free_chunks_before(p_table, nullptr);
+    while (p_table->p_change_chunks != nullptr) {
+        rg_i_change_chunk_t * const p_older = p_table->p_change_chunks->p_older;
+        std::free(p_table->p_change_chunks);
+        p_table->p_change_chunks = p_older;
+    }
 }

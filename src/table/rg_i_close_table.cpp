@@ -20,7 +20,7 @@ kt_int32_t rg_i_close_table(rg_i_table_t * p_table)
     rg_i_key_index_drop(p_table);
     std::free(p_table->p_rows_fixed_index);
     std::free(p_table->p_rows_packed_index);
-    rg_i_drop_change_entries(p_table);
+    rg_i_free_change_entries(p_table);
     std::free(p_table->p_name);
     if (p_table->p_file_path != nullptr) {
         std::free(p_table->p_file_path);

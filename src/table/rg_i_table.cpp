@@ -371,7 +371,7 @@ kt_int32_t rg_i_add_change_entry(rg_i_table_t * p_table, rg_i_index_entry_t * p_
 
 void rg_i_free_change_lists(rg_i_table_t * p_table)
 {
-    rg_i_forget_change_entries(p_table);
+    rg_i_free_change_entries(p_table);
     p_table->p_rows_change_list             = nullptr;
     p_table->p_rows_change_list_tail        = nullptr;
     p_table->p_delete_rows_change_list      = nullptr;

@@ -493,6 +493,112 @@ TEST(freeing_records, everything_freed_leaves_32_used_bytes_a_block)
     EXPECT_EQ(chain_of(pool).size(), blocks.size()) << "records of different blocks never join";
 }
 
+// Two pools in which the same happens, and of which one gathers what is freed.
+struct gathering_pool : testing::Test {
+    static constexpr std::size_t total_records = 3000;
+
+    gathering_pool()
+    {
+        random_numbers random(7);
+        for (std::size_t i = 0; i < total_records; ++i) {
+            const kt_uint32_t length = random() % 300;
+            records.push_back(gathering.allocate(length));
+            records_of_other.push_back(at_once.allocate(length));
+        }
+        std::iota(order.begin(), order.end(), 0);
+        std::shuffle(order.begin(), order.end(), random);
+    }
+    void free_both(std::size_t i)
+    {
+        gathering.free(records[i]);
+        at_once.free(records_of_other[i]);
+    }
+    // Number of the block and offset in it, so that places in both pools compare.
+    static std::pair<std::size_t, std::ptrdiff_t> place_of(const test_pool & pool, const char * p)
+    {
+        const auto blocks = blocks_of(pool);
+        for (std::size_t i = 0; i < blocks.size(); ++i) {
+            const auto * const p_block = reinterpret_cast<const char *>(blocks[i]);
+            if (p >= p_block && p < p_block + blocks[i]->total_bytes)
+                return {i, p - p_block};
+        }
+        return {SIZE_MAX, 0};
+    }
+    static auto places_in(const test_pool & pool)
+    {
+        std::vector<std::pair<std::pair<std::size_t, std::ptrdiff_t>, kt_uint32_t>> places;
+        for (const auto & [p_record, length] : chain_of(pool))
+            places.emplace_back(place_of(pool, p_record), length);
+        std::sort(places.begin(), places.end()); // the heap may have ordered the blocks otherwise
+        return places;
+    }
+    void expect_same()
+    {
+        const auto chain = chain_of(gathering);
+        EXPECT_TRUE(std::is_sorted(chain.begin(), chain.end()));
+        EXPECT_EQ(places_in(gathering), places_in(at_once));
+        EXPECT_EQ(gathering.used_bytes, at_once.used_bytes);
+        EXPECT_EQ(gathering.used_bytes, used_bytes_by_records(gathering));
+    }
+
+    test_pool                  gathering;
+    test_pool                  at_once;
+    std::vector<kt_char_ptr_t> records;
+    std::vector<kt_char_ptr_t> records_of_other;
+    std::vector<std::size_t>   order = std::vector<std::size_t>(total_records);
+};
+
+TEST_F(gathering_pool, frees_what_it_gathered_with_the_same_outcome)
+{
+    const auto        before = chain_of(gathering);
+    const kt_uint32_t used   = gathering.used_bytes;
+    rg_i_rb_gather_frees(&gathering, total_records);
+    for (std::size_t i = 0; i < 2000; ++i)
+        free_both(order[i]);
+    EXPECT_EQ(chain_of(gathering), before) << "nothing goes before the end";
+    EXPECT_EQ(gathering.used_bytes, used);
+    rg_i_rb_free_gathered(&gathering);
+    expect_same();
+    for (std::size_t i = 2000; i < total_records; ++i)
+        free_both(order[i]); // at once again, in both
+    expect_same();
+    EXPECT_EQ(gathering.used_bytes, 32 * blocks_of(gathering).size());
+}
+
+TEST_F(gathering_pool, frees_at_once_what_is_more_than_was_expected)
+{
+    rg_i_rb_gather_frees(&gathering, 1000);
+    for (std::size_t i = 0; i < 2000; ++i)
+        free_both(order[i]);
+    rg_i_rb_free_gathered(&gathering);
+    expect_same();
+}
+
+TEST_F(gathering_pool, frees_at_once_without_memory_and_where_few_are_expected)
+{
+    fault_scope faults;
+    fail_call(call::allocation, 1, ENOMEM);
+    rg_i_rb_gather_frees(&gathering, total_records);
+    for (std::size_t i = 0; i < 1000; ++i)
+        free_both(order[i]);
+    expect_same();
+    rg_i_rb_free_gathered(&gathering);
+    rg_i_rb_gather_frees(&gathering, 10);
+    for (std::size_t i = 1000; i < 2000; ++i)
+        free_both(order[i]);
+    expect_same();
+    rg_i_rb_free_gathered(&gathering);
+    expect_same();
+}
+
+TEST_F(gathering_pool, has_nothing_to_do_where_nothing_was_freed)
+{
+    rg_i_rb_gather_frees(&gathering, total_records);
+    rg_i_rb_free_gathered(&gathering);
+    rg_i_rb_free_gathered(&gathering);
+    expect_same();
+}
+
 TEST(freeing_records, the_data_is_not_cleared_by_it)
 {
     test_pool  pool;

@@ -91,7 +91,8 @@ TEST_P(running_out_of_memory, while_the_index_grows_leaves_the_table_as_it_was)
         },
         [&](rg_opaque_handle_t table) { return rg_add_row_1(table, a.names, a.values, 2); },
         [&](rg_opaque_handle_t table) { EXPECT_EQ(find_key(table, uint32(100)), 100); });
-    EXPECT_EQ(allocations, 3u) << "both arrays and a change entry; the hash element stands in its bucket";
+    EXPECT_EQ(allocations, 2u)
+        << "both arrays; the hash element stands in its bucket, and change entries are left over";
 }
 
 TEST_P(running_out_of_memory, while_reviving_a_row_leaves_it_deleted)

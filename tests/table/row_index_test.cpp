@@ -265,14 +265,44 @@ TEST(a_change, that_finds_no_memory_leaves_both_lists_and_the_slot_as_they_were)
     fault_scope faults;
     lone_table  table(number_columns());
     auto *      p_slots = table->p_rows_fixed_index;
-    for (int i = 0; i < 2; ++i)
-        rg_i_rows_free_chain_remove(table.get());
-    ASSERT_EQ(rg_i_add_change_entry(table.get(), p_slots), 0);
+    rg_i_rows_free_chain_remove(table.get());
     fail_call(call::allocation, 1, ENOMEM);
-    EXPECT_EQ(rg_i_add_change_entry(table.get(), p_slots + 1), RG_E_NO_MEMORY);
+    EXPECT_EQ(rg_i_add_change_entry(table.get(), p_slots), RG_E_NO_MEMORY);
     EXPECT_EQ(error_code(), RG_E_NO_MEMORY);
-    EXPECT_EQ(+p_slots[1].p_pending_change, nullptr);
-    EXPECT_EQ(listed(table.get(), 0), (std::vector<kt_uint32_t>{0}));
+    EXPECT_EQ(+p_slots[0].p_pending_change, nullptr);
+    EXPECT_EQ(listed(table.get(), 0), std::vector<kt_uint32_t>{});
+
+    reset_calls();
+    fail_call(call::allocation, 2, ENOMEM);
+    std::vector<kt_uint32_t> changed;
+    while (calls_made(call::allocation) < 2) { // until the entries of the first allocation are used up
+        const auto slot = static_cast<kt_uint32_t>(changed.size());
+        ASSERT_LT(slot, 100u);
+        rg_i_rows_free_chain_remove(table.get());
+        const kt_int32_t rc = rg_i_add_change_entry(table.get(), p_slots + slot);
+        if (calls_made(call::allocation) < 2) {
+            ASSERT_EQ(rc, 0);
+            changed.push_back(slot);
+            continue;
+        }
+        EXPECT_EQ(rc, RG_E_NO_MEMORY);
+        EXPECT_EQ(+p_slots[slot].p_pending_change, nullptr);
+    }
+    EXPECT_GT(changed.size(), 1u);
+    EXPECT_EQ(listed(table.get(), 0), changed);
+}
+
+TEST(change_entries, of_a_thousand_rows_take_few_allocations)
+{
+    fault_scope faults;
+    lone_table  table(number_columns());
+    reset_calls();
+    std::vector<rg_i_index_entry_t> rows(1000);
+    for (auto & row : rows)
+        ASSERT_EQ(rg_i_add_change_entry(table.get(), &row), 0);
+    EXPECT_LE(calls_made(call::allocation), 7u);
+    rg_i_free_change_lists(table.get());
+    EXPECT_EQ(table->p_change_chunks, nullptr);
 }
 
 TEST(freeing_the_change_lists, empties_both_and_leaves_the_slots_alone)
