@@ -26,6 +26,13 @@ target_link_libraries(kt_library_options INTERFACE kt_options)
 target_compile_options(kt_library_options INTERFACE $<$<COMPILE_LANGUAGE:CXX>:-fno-exceptions -fno-rtti>
                                                     -fvisibility=hidden)
 
+# The shared libraries are optimised as a whole when they are linked: an exported call then costs a tenth less. Their
+# objects hold both forms, since in the archives each file stays for itself, so that tests can put themselves between.
+if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU" AND NOT KT_SANITIZE)
+  set(kt_whole_library $<$<CONFIG:Release>:-flto=auto>)
+  set(kt_both_forms $<$<CONFIG:Release>:-flto=auto;-ffat-lto-objects>)
+endif()
+
 # kt_add_library(<name> EXPORTS <version script> LINK <libraries> SOURCES ...)
 #
 # Makes from one set of objects the shared library lib<name>.so.1, which exports what the version script names, and the
@@ -36,12 +43,13 @@ function(kt_add_library name)
   add_library(${name}_objects OBJECT ${ARG_SOURCES})
   target_include_directories(${name}_objects PUBLIC ${PROJECT_SOURCE_DIR}/include PRIVATE ${PROJECT_SOURCE_DIR}/src)
   target_link_libraries(${name}_objects PRIVATE kt_library_options)
+  target_compile_options(${name}_objects PRIVATE "${kt_both_forms}")
 
   add_library(${name} SHARED $<TARGET_OBJECTS:${name}_objects>)
   target_include_directories(${name} PUBLIC $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/include>
                                             $<INSTALL_INTERFACE:${CMAKE_INSTALL_INCLUDEDIR}>)
   target_link_libraries(${name} PRIVATE $<BUILD_INTERFACE:kt_library_options> Threads::Threads)
-  target_link_options(${name} PRIVATE -Wl,--version-script=${ARG_EXPORTS} -Wl,--no-undefined-version)
+  target_link_options(${name} PRIVATE "${kt_whole_library}" -Wl,--version-script=${ARG_EXPORTS} -Wl,--no-undefined-version)
   set_target_properties(${name} PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
                                            LINK_DEPENDS ${ARG_EXPORTS}
                                            INSTALL_RPATH "$ORIGIN") # the libraries find each other under any prefix
