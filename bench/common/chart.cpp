@@ -14,7 +14,7 @@ namespace
 {
 
 // Pixels.
-constexpr double width  = 760;
+constexpr double width  = 760; // or more, for long labels
 constexpr double height = 400;
 constexpr double left   = 76;
 constexpr double right  = 560; // of the plot; behind it stand the labels
@@ -97,6 +97,19 @@ std::string escaped(const std::string & text)
     return result;
 }
 
+// Wide enough for the labels and the figures behind them.
+double width_of(const chart & c)
+{
+    constexpr double a_letter = 7.5;
+    double           widest   = width;
+    for (const line & l : c.lines)
+        if (!l.label.empty()) {
+            const std::size_t letters = l.label.size() + 1 + c.figure_text(l.points.back().second).size();
+            widest                    = std::max(widest, right + 22 + a_letter * static_cast<double>(letters));
+        }
+    return widest;
+}
+
 void draw_grid(fmt::ostream & out, const chart & c, const axis & x, const axis & y)
 {
     for (const double value : y.ticks(true)) {
@@ -163,7 +176,7 @@ void write_svg(const chart & c, const std::string & path)
 {
     const auto [x, y] = axes_of(c);
     auto out          = fmt::output_file(path);
-    out.print("<svg xmlns='http://www.w3.org/2000/svg' width='{0}' height='{1}' viewBox='0 0 {0} {1}'>\n", width,
+    out.print("<svg xmlns='http://www.w3.org/2000/svg' width='{0}' height='{1}' viewBox='0 0 {0} {1}'>\n", width_of(c),
               height);
     out.print("<!-- SPDX-License-Identifier: MIT -->\n{}", style);
     out.print("<text class='title' x='16' y='26'>{}</text>\n", escaped(c.title));

@@ -19,6 +19,7 @@ struct picture {
     const char *                  title;
     const char *                  subtitle;
     std::vector<std::string_view> curves;
+    bool                          in_pairs = false; // beside the syncs of the moment, not in time
 };
 
 // All of them stand out from white and from black.
@@ -70,8 +71,9 @@ const std::vector<picture> & pictures()
           "memory access"}},
         {"transactions",
          "Durable transactions of one row",
-         "per transaction; solid: a fresh file, dashed: ten versions of each row, dotted: opened anew",
-         {"durable set", "durable add", "durable delete", "fsync pair"}},
+         "in fsync pairs right behind them; solid: a fresh file, dashed: ten versions a row, dotted: opened anew",
+         {"durable set", "durable add", "durable delete"},
+         true},
     };
     return all;
 }
@@ -91,13 +93,13 @@ const char * dashes_of(state s)
 }
 
 // The line of the first state has the label.
-void add_lines(const figures & all, const curve & c, const char * p_color, chart & to)
+void add_lines(const figures & all, const curve & c, const char * p_color, bool in_pairs, chart & to)
 {
     bool first = true;
     for (const state s : all.states_of(c.name)) {
         line l{first ? c.name : "", p_color, dashes_of(s), c.in == family::machine ? 1.0 : 2.0, {}};
         for (const std::size_t rows : all.sizes_of(c.name, s))
-            l.points.emplace_back(rows, all.of(c.name, s, rows)->median);
+            l.points.emplace_back(rows, in_pairs ? *all.pairs_of(c.name, s, rows) : all.of(c.name, s, rows)->median);
         first = false;
         to.lines.push_back(std::move(l));
     }
@@ -109,12 +111,13 @@ chart chart_of(const figures & all, const picture & p)
     c.title         = p.title;
     c.subtitle      = p.subtitle;
     c.x_text        = [](double rows) { return with_separators(static_cast<std::size_t>(rows)); };
-    c.y_text        = [](double value) { return text_of(value, unit::nanoseconds, digits::needed); };
-    c.figure_text   = [](double value) { return text_of(value, unit::nanoseconds); };
+    const unit in   = p.in_pairs ? unit::times : unit::nanoseconds;
+    c.y_text        = [in](double value) { return text_of(value, in, digits::needed); };
+    c.figure_text   = [in](double value) { return text_of(value, in); };
     std::size_t pen = 0;
     for (const std::string_view name : p.curves) {
         const curve & one = curve_of(name);
-        add_lines(all, one, one.in == family::machine ? limit : colors[pen++ % std::size(colors)], c);
+        add_lines(all, one, one.in == family::machine ? limit : colors[pen++ % std::size(colors)], p.in_pairs, c);
     }
     return c;
 }
