@@ -169,6 +169,31 @@ std::byte * write_item(kt_data_type_t type, const std::byte * p_record, std::byt
     return p_item;
 }
 
+// Writes the item of a value of that type into room of so many bytes, and tells its length.
+[[nodiscard]] kt_int32_t build_item(kt_data_type_t type, const std::byte * p_record, std::byte * p_item,
+                                    std::uint64_t room, text_conversion & text, std::uint64_t * p_length)
+{
+    measuring total{&text, room};
+    if (const kt_int32_t rc = measure_item(type, p_record, 1, total); rc != 0)
+        return rc;
+    // Nothing below fails.
+    static_cast<void>(write_item(type, p_record, p_item, text));
+    *p_length = total.length;
+    return 0;
+}
+
+// The same for a string that goes through unchanged, which most items are.
+[[nodiscard]] kt_int32_t build_plain_string(const std::byte * p_string, std::byte * p_item, std::uint64_t room,
+                                            std::uint64_t * p_length)
+{
+    const std::size_t length = std::strlen(reinterpret_cast<const char *>(p_string)) + 1;
+    if (length > room)
+        return KT_PMSG_E_NO_ROOM;
+    std::memcpy(p_item, p_string, length);
+    *p_length = length;
+    return 0;
+}
+
 } // namespace
 
 } // namespace kt_pmsg_i
@@ -200,15 +225,16 @@ extern "C" kt_int32_t kt_pmsg_build_conv_protocol_value_1(ku_iconv_t * p_string_
 
     const std::byte * const p_record = client_record(form, p_client);
     text_conversion         text(p_string_conversion_handle);
-    measuring               total{&text, indirect_data_capacity - offset};
-    if (const kt_int32_t rc = measure_item(type, p_record, 1, total); rc != 0)
+    std::byte * const       p_item = static_cast<std::byte *>(p_indirect_data) + offset;
+    const std::uint64_t     room   = indirect_data_capacity - offset;
+    std::uint64_t           length = 0;
+    const kt_int32_t        rc     = form == item_form::string && text.is_identity()
+                                         ? build_plain_string(p_record, p_item, room, &length)
+                                         : build_item(type, p_record, p_item, room, text, &length);
+    if (rc != 0)
         return rc;
-
-    // Nothing below fails.
-    std::byte * const p_item = static_cast<std::byte *>(p_indirect_data) + offset;
-    static_cast<void>(write_item(type, p_record, p_item, text));
-    store_anchor(p_target, offset, total.length);
-    *p_running_offset = offset + static_cast<kt_pmsg_off_t>(total.length);
+    store_anchor(p_target, offset, length);
+    *p_running_offset = offset + static_cast<kt_pmsg_off_t>(length);
     return 0;
 }
 
