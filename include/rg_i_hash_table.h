@@ -36,6 +36,13 @@ kt_int32_t               rg_i_hash_table_close(rg_hash_table_t * p_hash_table);
                                              kt_uint32_t row_index, kt_uint32_t * p_hash_index,
                                              rg_hash_table_element_t ** p_p_hash_table_element,
                                              rg_qualifier_t             qualifier);
+// The two steps of adding, for a caller with many keys: it has the buckets fetched ahead. The bucket is the key's, which
+// is as the caller's function returned it and may be out of range.
+void                     rg_i_hash_table_fetch_bucket(const rg_hash_table_t * p_hash_table, kt_uint32_t bucket);
+[[nodiscard]] kt_int32_t rg_i_hash_table_add_to_bucket(rg_hash_table_t * p_hash_table, kt_uint32_t bucket,
+                                                       kt_char_ptr_t p_key_value, kt_uint32_t row_index,
+                                                       rg_hash_table_element_t ** p_p_hash_table_element,
+                                                       rg_qualifier_t             qualifier);
 [[nodiscard]] kt_int32_t rg_i_hash_table_get_index(rg_hash_table_t * p_hash_table, kt_char_ptr_t p_key_value,
                                                    kt_uint32_t * row_index, kt_char_ptr_t ** p_p_p_key_value);
 // The same for a caller who goes on to what the row index leads to: entry row_index of an array with entries of so many

@@ -136,11 +136,30 @@ kt_uint32_t rg_i_hash_table_bucket(const rg_hash_table_t * p_hash_table, kt_char
     return last_word & (handle_buckets - 1);
 }
 
+void rg_i_hash_table_fetch_bucket(const rg_hash_table_t * p_hash_table, kt_uint32_t bucket)
+{
+    if (bucket >= p_hash_table->total_hash_buckets)
+        return;
+    __builtin_prefetch(&p_hash_table->p_elements[bucket], 1);
+    __builtin_prefetch(&p_hash_table->p_places[bucket], 1);
+}
+
 kt_int32_t rg_i_hash_table_add(rg_hash_table_t * p_hash_table, kt_char_ptr_t p_key_value, kt_uint32_t row_index,
                                kt_uint32_t * p_hash_index, rg_hash_table_element_t ** p_p_hash_table_element,
                                rg_qualifier_t qualifier)
 {
     const kt_uint32_t bucket = rg_i_hash_table_bucket(p_hash_table, p_key_value);
+    const kt_int32_t  rc =
+        rg_i_hash_table_add_to_bucket(p_hash_table, bucket, p_key_value, row_index, p_p_hash_table_element, qualifier);
+    if (rc == 0)
+        *p_hash_index = bucket;
+    return rc;
+}
+
+kt_int32_t rg_i_hash_table_add_to_bucket(rg_hash_table_t * p_hash_table, kt_uint32_t bucket, kt_char_ptr_t p_key_value,
+                                         kt_uint32_t row_index, rg_hash_table_element_t ** p_p_hash_table_element,
+                                         rg_qualifier_t qualifier)
+{
     if (bucket >= p_hash_table->total_hash_buckets)
         return rg_i_fail_internal(RG_HERE);
 
@@ -159,7 +178,6 @@ kt_int32_t rg_i_hash_table_add(rg_hash_table_t * p_hash_table, kt_char_ptr_t p_k
     // Nothing below fails.
     *p_element                       = {row_index, p_key_value, p_hash_table->p_elements[bucket]};
     p_hash_table->p_elements[bucket] = p_element;
-    *p_hash_index                    = bucket;
     *p_p_hash_table_element          = p_element;
     return 0;
 }

@@ -106,27 +106,58 @@ void leave_packed_index(rg_i_table_t * p_table, const rg_i_index_entry_t & leavi
     p_table->p_rows_fixed_index[moved_row].packed_index = packed_index;
 }
 
-// Enters a row that was filled in directly into the packed index and the hash table.
-[[nodiscard]] kt_int32_t give_secondary_access(rg_i_table_t * p_table, kt_uint32_t slot, kt_uint32_t packed_index)
-{
-    rg_i_index_entry_t & entry                 = p_table->p_rows_fixed_index[slot];
-    p_table->p_rows_packed_index[packed_index] = slot;
-    entry.packed_index                         = packed_index;
-    if (p_table->p_rows_hash_table == nullptr)
-        return 0;
+// Rows that were filled in directly, to be entered in the packed index and the hash table. A bucket lies anywhere in
+// memory: those of some rows are fetched at once, so that their coming overlaps.
+struct new_rows_t {
+    static constexpr kt_uint32_t most = 32;
 
-    kt_char_ptr_t p_key = rg_i_row_key(p_table, entry.p_committed);
-    if (p_key == nullptr)
-        return rg_i_fail(RG_HERE, RG_E_TABLE_UNREADABLE);
-    kt_uint32_t               hash_index           = 0;
-    rg_hash_table_element_t * p_hash_table_element = nullptr;
-    // A duplicate key has no error record: it passes from here to the caller as it is.
-    if (const kt_int32_t rc = rg_i_hash_table_add(p_table->p_rows_hash_table, p_key, slot, &hash_index,
-                                                  &p_hash_table_element, p_table->p_columns[0].qualifier);
-        rc != 0)
-        return rc;
-    entry.hash_index           = hash_index;
-    entry.p_hash_table_element = p_hash_table_element;
+    kt_uint32_t   total = 0;
+    kt_uint32_t   slots[most];
+    kt_char_ptr_t keys[most]; // NULL: the record is damaged
+    kt_uint32_t   buckets[most];
+};
+
+void find_buckets(const rg_i_table_t * p_table, new_rows_t & rows)
+{
+    for (kt_uint32_t i = 0; i < rows.total; ++i) {
+        rows.keys[i] = rg_i_row_key(p_table, p_table->p_rows_fixed_index[rows.slots[i]].p_committed);
+        if (rows.keys[i] == nullptr)
+            return;
+        rows.buckets[i] = rg_i_hash_table_bucket(p_table->p_rows_hash_table, rows.keys[i]);
+        rg_i_hash_table_fetch_bucket(p_table->p_rows_hash_table, rows.buckets[i]);
+    }
+}
+
+[[nodiscard]] kt_int32_t enter_in_hash_table(rg_i_table_t * p_table, new_rows_t & rows)
+{
+    find_buckets(p_table, rows);
+    for (kt_uint32_t i = 0; i < rows.total; ++i) {
+        if (rows.keys[i] == nullptr)
+            return rg_i_fail(RG_HERE, RG_E_TABLE_UNREADABLE);
+        rg_i_index_entry_t &      entry                = p_table->p_rows_fixed_index[rows.slots[i]];
+        rg_hash_table_element_t * p_hash_table_element = nullptr;
+        // A duplicate key has no error record: it passes from here to the caller as it is.
+        if (const kt_int32_t rc =
+                rg_i_hash_table_add_to_bucket(p_table->p_rows_hash_table, rows.buckets[i], rows.keys[i], rows.slots[i],
+                                              &p_hash_table_element, p_table->p_columns[0].qualifier);
+            rc != 0)
+            return rc;
+        entry.hash_index           = rows.buckets[i];
+        entry.p_hash_table_element = p_hash_table_element;
+    }
+    return 0;
+}
+
+[[nodiscard]] kt_int32_t give_secondary_access(rg_i_table_t * p_table, new_rows_t & rows, kt_uint32_t * p_packed_index)
+{
+    for (kt_uint32_t i = 0; i < rows.total; ++i) {
+        p_table->p_rows_packed_index[*p_packed_index]           = rows.slots[i];
+        p_table->p_rows_fixed_index[rows.slots[i]].packed_index = (*p_packed_index)++;
+    }
+    if (p_table->p_rows_hash_table != nullptr)
+        if (const kt_int32_t rc = enter_in_hash_table(p_table, rows); rc != 0)
+            return rc;
+    rows.total = 0;
     return 0;
 }
 
@@ -226,18 +257,23 @@ kt_int32_t rg_i_establish_rows_index(rg_i_table_t * p_table, kt_uint32_t maximum
 
 kt_int32_t rg_i_establish_secondary_row_access(rg_i_table_t * p_table)
 {
+    new_rows_t  rows;
     kt_uint32_t packed_index = 0;
-    for (kt_uint32_t slot = 0; packed_index < p_table->total_committed_rows; ++slot) {
+    for (kt_uint32_t slot = 0; packed_index + rows.total < p_table->total_committed_rows; ++slot) {
         // Only a file whose deletions don't fit its rows can count more rows than there are.
-        if (slot == p_table->maximum_rows)
+        if (slot == p_table->maximum_rows) {
+            if (const kt_int32_t rc = give_secondary_access(p_table, rows, &packed_index); rc != 0)
+                return rc;
             return rg_i_fail(RG_HERE, RG_E_TABLE_UNREADABLE);
+        }
         if (p_table->p_rows_fixed_index[slot].p_committed == nullptr)
             continue;
-        if (const kt_int32_t rc = give_secondary_access(p_table, slot, packed_index); rc != 0)
-            return rc;
-        ++packed_index;
+        rows.slots[rows.total++] = slot;
+        if (rows.total == rows.most)
+            if (const kt_int32_t rc = give_secondary_access(p_table, rows, &packed_index); rc != 0)
+                return rc;
     }
-    return 0;
+    return give_secondary_access(p_table, rows, &packed_index);
 }
 
 kt_int32_t rg_i_grow_index(rg_i_table_t * p_table, kt_uint32_t total_new_rows)

@@ -249,6 +249,7 @@ union ku_constant_t {
     struct {
         kt_uint32_t offset; // in the program's texts
         kt_uint32_t length;
+        uint64_t    first_bytes; // in tests of columns: as they lie in memory, and then zeros
     } text;
     struct {
         kt_uint32_t members; // the next so many constants

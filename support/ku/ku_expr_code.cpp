@@ -44,6 +44,15 @@ void ku_expr_code::emit_column_test(ku_operation_t operation, unsigned detail, k
     code_[position() - 1].operand = column;
 }
 
+ku_constant_t ku_expr_code::literal_at(kt_uint32_t offset, kt_uint32_t length) const
+{
+    ku_constant_t literal = {};
+    literal.text          = {offset, length, 0};
+    std::memcpy(&literal.text.first_bytes, texts_.data() + offset,
+                std::min<size_t>(length, sizeof literal.text.first_bytes));
+    return literal;
+}
+
 void ku_expr_code::emit_truth(bool value)
 {
     push_integer(value ? 1 : 0);
@@ -107,7 +116,7 @@ void ku_expr_code::push_floating(double value)
 void ku_expr_code::push_text(kt_uint32_t offset, kt_uint32_t length)
 {
     ku_constant_t constant = {};
-    constant.text          = {offset, length};
+    constant.text          = {offset, length, 0};
     emit_constant(KU_OP_TEXT, constant);
 }
 
@@ -428,10 +437,10 @@ void ku_expr_code::test_column(const ku_instruction_t & column, uint8_t relation
     default:
         break;
     }
-    const ku_constant_t text = constants_[constant.constant];
-    const kt_uint32_t   id   = column.operand;
+    const auto        text = constants_[constant.constant].text;
+    const kt_uint32_t id   = column.operand;
     truncate(position() - 2, 2);
-    emit_column_test(KU_OP_STRING_IS, relation, id, text);
+    emit_column_test(KU_OP_STRING_IS, relation, id, literal_at(text.offset, text.length));
 }
 
 bool ku_expr_code::fuse_comparison(uint8_t relation, const ku_operand_t & left, const ku_operand_t & right)
@@ -518,10 +527,9 @@ void ku_expr_code::like(const ku_operand_t & left, const ku_operand_t & right, b
             ku_like_classify(texts_.data() + pattern.offset, pattern.length, p_new, &literal_length);
         texts_.truncate(its_class == KU_LIKE_GENERAL ? offset : offset + literal_length);
         if (its_class != KU_LIKE_GENERAL) {
-            ku_constant_t literal = {};
-            literal.text          = {static_cast<kt_uint32_t>(offset), static_cast<kt_uint32_t>(literal_length)};
             truncate(left.start, 2);
-            emit_column_test(tests[its_class], KU_EQ, column, literal);
+            emit_column_test(tests[its_class], KU_EQ, column,
+                             literal_at(static_cast<kt_uint32_t>(offset), static_cast<kt_uint32_t>(literal_length)));
             if (!failed_)
                 code_[position() - 1].negated = negated ? 1 : 0;
             return;
@@ -773,7 +781,7 @@ void ku_expr_code::text_of_literal(const ku_operand_t & literal, kt_uint32_t * p
 
 void ku_expr_code::replace_text(const ku_operand_t & literal, kt_uint32_t offset, kt_uint32_t length)
 {
-    constants_[code_[literal.start].constant].text = {offset, length};
+    constants_[code_[literal.start].constant].text = {offset, length, 0};
 }
 
 // ---- The end ----

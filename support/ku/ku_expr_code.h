@@ -80,18 +80,19 @@ class ku_expr_code
     ku_growable<uint8_t> & texts() { return texts_; }
 
   private:
-    void emit(ku_operation_t operation, unsigned detail, kt_uint32_t operand, int stack_effect);
-    void emit_constant(ku_operation_t operation, const ku_constant_t & constant);
-    void emit_column_test(ku_operation_t operation, unsigned detail, kt_uint32_t column,
-                          const ku_constant_t & constant);
-    void emit_truth(bool value);
-    void truncate(kt_uint32_t start, kt_uint32_t values);
-    void seal();
-    bool is_alone(kt_uint32_t start, kt_uint32_t end) const;
-    bool is_constant(kt_uint32_t start, kt_uint32_t end) const;
-    bool is_column(kt_uint32_t start, kt_uint32_t end) const;
-    void link_jump(kt_uint32_t instruction, kt_uint32_t * p_chain);
-    void to_floating(const ku_operand_t & left, const ku_operand_t & right);
+    void          emit(ku_operation_t operation, unsigned detail, kt_uint32_t operand, int stack_effect);
+    void          emit_constant(ku_operation_t operation, const ku_constant_t & constant);
+    void          emit_column_test(ku_operation_t operation, unsigned detail, kt_uint32_t column,
+                                   const ku_constant_t & constant);
+    void          emit_truth(bool value);
+    ku_constant_t literal_at(kt_uint32_t offset, kt_uint32_t length) const; // for a test of a column
+    void          truncate(kt_uint32_t start, kt_uint32_t values);
+    void          seal();
+    bool          is_alone(kt_uint32_t start, kt_uint32_t end) const;
+    bool          is_constant(kt_uint32_t start, kt_uint32_t end) const;
+    bool          is_column(kt_uint32_t start, kt_uint32_t end) const;
+    void          link_jump(kt_uint32_t instruction, kt_uint32_t * p_chain);
+    void          to_floating(const ku_operand_t & left, const ku_operand_t & right);
     bool fold_integers(ku_int_operation_t * p_operation, const ku_operand_t & left, const ku_operand_t & right);
     bool fold_floatings(ku_operation_t operation, const ku_operand_t & left, const ku_operand_t & right);
     bool fold_comparison(uint8_t relation, const ku_operand_t & left, const ku_operand_t & right);

@@ -155,7 +155,8 @@ template <kt_uint32_t Room>
             continue;
         }
         case KU_OP_COLUMN:
-            if (!ku_read_value(p->detail, ku_slot(row, *p), row.indirect, &stack[++top]))
+            if (!ku_read_value(p->detail, row.p_values + static_cast<size_t>(p->operand) * ku_slot_size, row.indirect,
+                               &stack[++top]))
                 return KU_EXPR_E_DAMAGED_VALUE;
             continue;
         case KU_OP_FIELD:
@@ -245,7 +246,7 @@ template <kt_uint32_t Room>
 
 #define KU_COLUMN_TEST(operation)                                                                                      \
     case operation: {                                                                                                  \
-        const ku_finding_t found = ku_test_column<operation>(program, *p, row);                                        \
+        const ku_finding_t found = ku_column_test_t<operation>(program, *p)(row);                                      \
         if (found == KU_FOUND_DAMAGED)                                                                                 \
             return KU_EXPR_E_DAMAGED_VALUE;                                                                            \
         truth = found == KU_FOUND_TRUE;                                                                                \

@@ -129,11 +129,16 @@ inline uint8_t ku_compare_ints(ku_int_t left, ku_int_t right)
     return left == right ? KU_EQUAL : left < right ? KU_LESS : KU_GREATER;
 }
 
+// The order of two floating-point numbers, or 0 if they have none.
+inline unsigned ku_order_of_floats(double left, double right)
+{
+    return static_cast<unsigned>(left < right) * KU_LESS + static_cast<unsigned>(left == right) * KU_EQUAL +
+           static_cast<unsigned>(left > right) * KU_GREATER;
+}
+
 inline uint8_t ku_compare_floats(double left, double right)
 {
-    const unsigned order = static_cast<unsigned>(left < right) * KU_LESS +
-                           static_cast<unsigned>(left == right) * KU_EQUAL +
-                           static_cast<unsigned>(left > right) * KU_GREATER;
+    const unsigned order = ku_order_of_floats(left, right);
     return order != 0 ? static_cast<uint8_t>(order) : static_cast<uint8_t>(KU_UNORDERED);
 }
 

@@ -45,9 +45,10 @@ template <ku_operation_t Operation>
 findings_t test_rows(const ku_program_t & program, const ku_instruction_t & instruction, const rows_t & rows,
                      row_set_t set)
 {
-    findings_t found = {};
+    const ku_column_test_t<Operation> test(program, instruction);
+    findings_t                        found = {};
     for_each(set, [&](size_t i) {
-        const row_set_t finding = ku_test_column<Operation>(program, instruction, rows[i]);
+        const row_set_t finding = test(rows[i]);
         found.truths |= (finding & KU_FOUND_TRUE) << i;
         found.damaged |= (finding & KU_FOUND_DAMAGED) / KU_FOUND_DAMAGED << i;
     });

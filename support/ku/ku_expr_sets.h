@@ -53,13 +53,14 @@ inline const ku_constant_t * ku_set_find(const ku_constant_t * p_set, uint64_t k
     return p->member.key == key ? p : nullptr;
 }
 
-inline bool ku_set_has_string(const ku_constant_t * p_set, const uint8_t * p_texts, const uint8_t * p, size_t length)
+inline bool ku_set_has_string(const ku_constant_t * p_set, const uint8_t * p_texts, const ku_extent_t & string)
 {
-    const uint64_t              key   = ku_set_key(p, length);
+    const uint64_t              key   = ku_set_key(string.p, string.length);
     const ku_constant_t * const p_end = p_set + 1 + p_set->set.members;
     for (const ku_constant_t * p_member = ku_set_find(p_set, key);
          p_member != nullptr && p_member != p_end && p_member->member.key == key; p_member++) {
-        if (p_member->member.length == length && std::memcmp(p_texts + p_member->member.offset, p, length) == 0)
+        if (p_member->member.length == string.length &&
+            std::memcmp(p_texts + p_member->member.offset, string.p, string.length) == 0)
             return true;
     }
     return false;

@@ -355,6 +355,29 @@ TEST_P(selecting_rows, of_two_rows_that_were_set_to_one_key_is_refused_where_key
     EXPECT_EQ(result == nullptr, GetParam().hashed);
 }
 
+TEST_P(selecting_rows, of_many_gives_a_table_that_finds_each_key_and_no_other)
+{
+    constexpr kt_uint32_t    rows  = 300;
+    const rg_opaque_handle_t table = make_numbered(rows);
+    ASSERT_EQ(commit(table), 0);
+    const rg_opaque_handle_t result = select(table, {}, "n != 1 && id not in (64, 100, 299)");
+    kt_uint32_t              slot   = 0;
+    for (kt_uint32_t id = 0; id < rows + 10; ++id) {
+        const bool is_there = id < rows && id % 3 != 1 && id != 299;
+        EXPECT_EQ(find_key(result, uint32(id)), is_there ? std::int64_t{slot} : -RG_E_NO_SUCH_KEY) << id;
+        slot += is_there ? 1 : 0;
+    }
+    picture_of(result);
+    EXPECT_EQ(rg_close_table_1(result), 0);
+
+    // Two of them come to have one key, far from each other.
+    ASSERT_EQ(set_fields_by_fixed_index(table, 230, {{"id", uint32(3)}}), 0);
+    ASSERT_EQ(commit(table), 0);
+    rg_opaque_handle_t refused = nullptr;
+    EXPECT_EQ(rg_select_1(table, nullptr, 0, &refused, nullptr), GetParam().hashed ? RG_E_DUPLICATE_KEY : 0);
+    EXPECT_EQ(refused == nullptr, GetParam().hashed);
+}
+
 struct a_select : ::testing::Test, registry_of_tables {
 };
 
