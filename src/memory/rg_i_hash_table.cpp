@@ -160,12 +160,13 @@ kt_int32_t rg_i_hash_table_add_to_bucket(rg_hash_table_t * p_hash_table, kt_uint
                                          kt_uint32_t row_index, rg_hash_table_element_t ** p_p_hash_table_element,
                                          rg_qualifier_t qualifier)
 {
+    const rg_i_site_t here{"rg_i_hash_table_add", __LINE__, __FILE_NAME__, module_version}; // one call to a user
     if (bucket >= p_hash_table->total_hash_buckets)
-        return rg_i_fail_internal(RG_HERE);
+        return rg_i_fail_internal(here);
 
     auto * const p_element = make_element(p_hash_table, bucket);
     if (p_element == nullptr)
-        return rg_i_fail_no_memory(RG_HERE);
+        return rg_i_fail_no_memory(here);
 
     if ((qualifier & qualifier_kind_mask) == RG_PRIMARY_KEY) {
         if (element_t * const p_equal = find_key(p_hash_table, bucket, p_key_value); p_equal != nullptr) {
