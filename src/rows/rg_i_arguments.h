@@ -30,7 +30,8 @@
 
 // Finds the arguments of the columns, which must be asked for in their order, each once. Callers mostly name them in that
 // order: the name behind the last one found is looked at first. It can't be the second of two equal names then, since
-// those ahead of it belong to other columns.
+// those ahead of it belong to other columns. (Where a damaged file gives two columns one name, and the caller names it
+// twice, each column gets a value of its own.)
 struct rg_i_argument_search_t {
     kt_char_ptr_t * p_column_names;
     kt_uint32_t     total_values;
@@ -38,9 +39,7 @@ struct rg_i_argument_search_t {
 
     [[nodiscard]] kt_uint32_t find(const kt_char_t * p_name)
     {
-        if (in_order == total_values)
-            return total_values;
-        if (rg_i_same_name(p_column_names[in_order], p_name))
+        if (in_order < total_values && rg_i_same_name(p_column_names[in_order], p_name))
             return in_order++;
         return rg_i_find_argument(p_column_names, total_values, p_name);
     }
