@@ -81,6 +81,14 @@ void read_all(rg_i_table_t * p_table)
         std::free(p_binary);
 }
 
+// Whether setting column 1 would set the key too: a damaged file may give them one name, or the key a default that
+// counts when it isn't named. Nobody checks whether a key that is set exists already, so that the table might not open.
+bool goes_with_the_key(const rg_i_table_t * p_table)
+{
+    return rg_i_find_column(p_table, p_table->p_columns[1].name) == 0 ||
+           (p_table->p_columns[0].qualifier & RG_SET_TO_DEFAULT_WHEN_UNSPECIFIED) != 0;
+}
+
 // Adds a row, changes one and deletes one, as far as the table lets us.
 void change(rg_i_table_t * p_table)
 {
@@ -89,7 +97,7 @@ void change(rg_i_table_t * p_table)
     std::memset(&key, 0, sizeof key);
     kt_value_t * p_key = &key;
     (void)rg_i_add_row(p_table, &p_key_name, &p_key, 1);
-    if (p_table->total_columns > 1)
+    if (p_table->total_columns > 1 && !goes_with_the_key(p_table))
         (void)rg_i_set_value_for_packed_index(p_table, 0, p_table->p_columns[1].name, &key);
     if (p_table->total_applied_rows > 1)
         (void)rg_i_delete_row(p_table, &p_table->p_rows_fixed_index[p_table->p_rows_packed_index[1]]);
